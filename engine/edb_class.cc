@@ -1,6 +1,9 @@
 #include "engine/edb_class.h"
 
 #include "engine/adjustment_probe.h"
+#include "engine/catalog.h"
+#include "engine/leaf_harvest.h"
+#include "engine/tree_walk.h"
 #include "engine/edb2010_class.h"
 
 namespace tarnwell::engine {
@@ -128,6 +131,87 @@ bool EdbClass::ScanLeafPages() {
   return true;
 }
 
+int EdbClass::CollectTreeRecords(uint32_t page_number) {
+  running_->store(true);
+  TreeWalker walker(file_, *progress_, *running_);
+  return walker.Walk(page_number, [this](const Page&, const RecordRef& ref) {
+    if (ref.kind != kKindIndex) records_.push_back(ref);
+    return true;
+  });
+}
+
+int EdbClass::CollectLeafPageRecords() {
+  LeafHarvest harvest(file_, *progress_, *running_, &records_);
+  int result = harvest.CollectLeafPageRecords(leaf_pages_);
+  leaf_pages_.clear();
+  leaf_pages_.shrink_to_fit();
+  return result;
+}
+
+bool EdbClass::FollowLeafChain(uint32_t page_number) {
+  LeafHarvest harvest(file_, *progress_, *running_, &records_);
+  return harvest.FollowLeafChain(page_number);
+}
+
+int EdbClass::ParseCatalogRecords() {
+  constexpr int kPermille = 1000;
+  constexpr size_t kProgressEvery = 100;
+  progress_->Range(0, kPermille);
+  progress_->Position(0);
+  CatalogBuilder builder;
+  // References come grouped by page: keep the last page read.
+  Page page;
+  uint32_t page_number = 0;
+  bool page_ok = false;
+  for (size_t k = 0; k < records_.size(); ++k) {
+    if (k % kProgressEvery == 0) progress_->Position(int(k * kPermille / records_.size()));
+    const RecordRef& ref = records_[k];
+    if (!page_ok || ref.page_number != page_number) {
+      page_number = ref.page_number;
+      page_ok = ReadPage(page_number, &page);
+    }
+    if (!page_ok || ref.tag_index >= page.nodes().size()) continue;
+    const NodeEntry& node = page.nodes()[ref.tag_index];
+    if (ref.data_offset > node.size) continue;
+    CatalogEntry entry;
+    bool extended = false;
+    ParseCatalogRecord(node.bytes.From(ref.data_offset), &entry, &extended);
+    if (extended && version_ == kExchange2013) extended_catalog_ = true;
+    builder.Add(std::move(entry));
+  }
+  tables_ = builder.Finish();
+  records_.clear();
+  records_.shrink_to_fit();
+  return 1;
+}
+
+int EdbClass::ForEachRecord(const TableDef& table, const RecordVisitor& visit) {
+  std::vector<const CatalogEntry*> columns;
+  for (const CatalogEntry& c : table.columns) columns.push_back(&c);
+  const TaggedForm form = tagged_form();
+  TreeWalker walker(file_, *progress_, *running_);
+  walker.set_want_keys(false);
+  return walker.Walk(table.table.root_page(), [&](const Page& page, const RecordRef& ref) {
+    if (ref.kind != kKindRecord) return true;
+    RecordColumns split;
+    if (!split.Split(NodeData(page, ref), columns, form)) return true;
+    return visit(ref, split);
+  });
+}
+
+std::vector<std::string> EdbClass::GetTableNames() {
+  table_names_.clear();
+  for (const TableDef& t : tables_) table_names_.push_back(ListedTableName(t.name(), family()));
+  return table_names_;
+}
+
+const TableDef* EdbClass::FindTable(const std::string& name) const {
+  for (const TableDef& t : tables_) {
+    if (t.name() == name) return &t;
+  }
+  return nullptr;
+}
+
 bool EdbClass::ReadPage(uint32_t page_number, Page* page) const {
   return file_.ReadPage(page_number, page).ok();
 }
@@ -159,8 +243,7 @@ RecordRef EdbClass::MakeRecordRef(uint32_t page_number, uint16_t tag) const {
   if (DecodeNode(page, tag, &ref) != NodeDecode::kOk) return RecordRef();
   ref.page_number = page_number;
   ref.kind = page.is_leaf() ? LeafKind(page.flags()) : char(kKindNone);
-  const int64_t node_position = file_.PagePosition(page_number) + page.nodes()[tag].offset;
-  ref.file_position = uint64_t(node_position - 2 * int64_t(file_.page_size()));
+  ref.file_position = RecordFilePosition(file_, page_number, page.nodes()[tag].offset);
   return ref;
 }
 

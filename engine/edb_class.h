@@ -14,6 +14,7 @@
 #define TARNWELL_ENGINE_EDB_CLASS_H_
 
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <string>
 #include <vector>
@@ -24,6 +25,7 @@
 #include "engine/catalog_entry.h"
 #include "engine/database_header.h"
 #include "engine/leaf_page_scan.h"
+#include "engine/long_value.h"
 #include "engine/page_file.h"
 #include "engine/record_columns.h"
 #include "engine/record_ref.h"
@@ -85,6 +87,27 @@ class EdbClass {
   bool ScanLeafPages();
   const std::vector<LeafPageEntry>& leaf_pages() const { return leaf_pages_; }
 
+  // Walks the tree rooted at page n and pushes every leaf record reference
+  // (but index leaves) on the record vector. 1 done, 0 failed.
+  int CollectTreeRecords(uint32_t page_number);
+  // Harvests the leaf-page list into the record vector (Advance and Deep
+  // Mode); the list is emptied.
+  int CollectLeafPageRecords();
+  bool FollowLeafChain(uint32_t page_number);
+  std::vector<RecordRef>& records() { return records_; }
+
+  // Decodes the record vector as catalog records into the table list and
+  // empties the vector. Always 1.
+  int ParseCatalogRecords();
+  // The table names in catalog order (legacy family: up to the first '-'
+  // dropped); also kept by the reader.
+  std::vector<std::string> GetTableNames();
+  const std::vector<TableDef>& tables() const { return tables_; }
+  const TableDef* FindTable(const std::string& name) const;
+  // Set when a catalog record with last fixed id 12 was met in an Exchange
+  // 2013 database.
+  bool extended_catalog() const { return extended_catalog_; }
+
   // Reads one page; false when it cannot be read or is rejected.
   bool ReadPage(uint32_t page_number, Page* page) const;
   NodeCopy ReadNode(uint32_t page_number, uint16_t tag) const;
@@ -96,6 +119,15 @@ class EdbClass {
   // of `template_table` when given). 0 done; -1 when `ref` is no record.
   int ReadRecordColumns(const RecordRef& ref, const TableDef& table,
                         const TableDef* template_table, RecordColumns* out) const;
+
+  // Walks the tree of `table` and splits each of its records. The visitor
+  // returns false to stop. 1 walked, 0 the root could not be walked.
+  using RecordVisitor = std::function<bool(const RecordRef& ref, RecordColumns& columns)>;
+  int ForEachRecord(const TableDef& table, const RecordVisitor& visit);
+
+  // Long values of this database. Chunks may be compressed in any family:
+  // Windows databases with 4 KiB pages compress them too.
+  LongValueReader long_values() const { return LongValueReader(file_, true); }
 
   // The tagged-value form records of this reader's database use.
   TaggedForm tagged_form() const;
@@ -115,6 +147,10 @@ class EdbClass {
   DatabaseHeader header_;
   bool header_valid_ = false;
   std::vector<LeafPageEntry> leaf_pages_;
+  std::vector<RecordRef> records_;
+  std::vector<TableDef> tables_;
+  std::vector<std::string> table_names_;
+  bool extended_catalog_ = false;
 
  private:
   void ReadHeader(uint64_t base_offset);

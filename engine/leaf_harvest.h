@@ -1,0 +1,52 @@
+// The leaf-page harvest: reads every listed leaf page and follows its chain
+// of next-page links, so that every leaf record of every tree in the file
+// lands in the record vector, whether or not its tree is still reachable.
+//
+// Each page is harvested at most once (the visited-page set), whether it is
+// reached from its own list entry or along a chain. List entries without a
+// next page are skipped: such a page is reached only through a chain.
+#ifndef TARNWELL_ENGINE_LEAF_HARVEST_H_
+#define TARNWELL_ENGINE_LEAF_HARVEST_H_
+
+#include <cstdint>
+#include <set>
+#include <vector>
+
+#include "base/progress_sink.h"
+#include "engine/leaf_page_scan.h"
+#include "engine/page_file.h"
+#include "engine/record_ref.h"
+
+namespace tarnwell::engine {
+
+class LeafHarvest {
+ public:
+  LeafHarvest(const PageFile& file, ProgressSink& progress, RunningFlag& running,
+              std::vector<RecordRef>* records)
+      : file_(file), progress_(progress), running_(running), records_(records) {}
+
+  // Harvests the pages of `list`. Always 1; a stop by the user ends it early
+  // with what was found.
+  int CollectLeafPageRecords(const std::vector<LeafPageEntry>& list);
+
+  // Harvests the chain starting at page n. False when the user stopped.
+  bool FollowLeafChain(uint32_t page_number);
+
+  // Keys are not copied by default: the catalog needs none, and millions of
+  // references must stay small.
+  void set_want_keys(bool want) { want_keys_ = want; }
+
+ private:
+  void PushNodes(const Page& page, uint32_t page_number);
+
+  const PageFile& file_;
+  ProgressSink& progress_;
+  RunningFlag& running_;
+  std::vector<RecordRef>* records_;
+  std::set<uint32_t> visited_;
+  bool want_keys_ = false;
+};
+
+}  // namespace tarnwell::engine
+
+#endif  // TARNWELL_ENGINE_LEAF_HARVEST_H_

@@ -1,0 +1,99 @@
+#include "engine/long_value.h"
+
+#include <algorithm>
+
+#include "engine/compress/compressed_value.h"
+#include "engine/tree_cursor.h"
+
+namespace tarnwell::engine {
+
+int LongValueReader::Read(uint32_t root_page, ByteView id, LongValue* out) const {
+  if (id.size() != kLongValueIdSize && id.size() != kLongValueId64Size) return -1;
+  *out = LongValue();
+  Bytes key(id.data(), id.data() + id.size());
+  std::reverse(key.begin(), key.end());  // stored little-endian, keyed big-endian
+
+  TreeCursor cursor(file_);
+  if (!cursor.Seek(root_page, ByteView(key))) return -1;
+  if (CompareKeys(cursor.key(), ByteView(key)) != 0) return -1;
+  ByteView root = cursor.data();
+  if (root.size() >= kLongValueRootDataSize) out->declared_size = root.U32LE(4);
+
+  struct Found {
+    uint64_t offset;
+    int64_t position;
+    uint32_t size;
+  };
+  std::vector<Found> found;
+  while (cursor.Next()) {
+    ByteView k = cursor.key();
+    if (k.size() != key.size() + kChunkOffsetSize ||
+        CompareKeys(k.Sub(0, key.size()), ByteView(key)) != 0) {
+      break;
+    }
+    found.push_back({LoadU32BE(k.data() + key.size()), cursor.data_position(),
+                     uint32_t(cursor.data().size())});
+  }
+
+  for (size_t i = 0; i < found.size(); ++i) {
+    const Found& f = found[i];
+    if (f.offset != out->total_size) {
+      if (f.offset < out->total_size) continue;  // overlaps what we have
+      out->truncated = true;                      // a chunk is missing
+      break;
+    }
+    uint64_t logical = f.size;
+    if (compressible_) {
+      const uint64_t end = i + 1 < found.size() ? found[i + 1].offset : out->declared_size;
+      if (end > f.offset && end - f.offset > f.size) logical = end - f.offset;
+    }
+    LongValueChunk chunk;
+    chunk.file_position = f.position;
+    chunk.stored_size = f.size;
+    chunk.logical_offset = out->total_size;
+    chunk.logical_size = logical;
+    chunk.compressed = logical != f.size;
+    out->chunks.push_back(chunk);
+    out->total_size += logical;
+  }
+  if (out->declared_size && out->total_size < out->declared_size) out->truncated = true;
+  return 0;
+}
+
+Status LongValueReader::ReadChunk(const LongValue& value, size_t index, Bytes* out) const {
+  if (index >= value.chunks.size()) return Status::InvalidArgument("no such chunk");
+  const LongValueChunk& c = value.chunks[index];
+  Bytes stored(c.stored_size);
+  if (file_.ReadAt(c.file_position, stored.data(), stored.size()) != stored.size()) {
+    return Status::IoError("long-value chunk past the end of the file");
+  }
+  if (!c.compressed) {
+    *out = std::move(stored);
+    return Status::Ok();
+  }
+  DecodedValue d = DecodeCompressedValue(ByteView(stored));
+  if (!d.ok()) {
+    // Keep the length promised so that later chunks stay at their offsets.
+    out->assign(c.logical_size, 0);
+    return Status::Corruption(std::string("compressed long-value chunk: ") + d.message);
+  }
+  *out = std::move(d.bytes);
+  out->resize(c.logical_size, 0);
+  return Status::Ok();
+}
+
+Status LongValueReader::ReadAll(const LongValue& value, Bytes* out, uint64_t limit) const {
+  out->clear();
+  if (value.total_size > limit) return Status::NotSupported("long value too large to hold");
+  out->reserve(value.total_size);
+  Status first_error;
+  for (size_t i = 0; i < value.chunks.size(); ++i) {
+    Bytes chunk;
+    Status s = ReadChunk(value, i, &chunk);
+    if (!s.ok() && first_error.ok()) first_error = s;
+    out->insert(out->end(), chunk.begin(), chunk.end());
+  }
+  return first_error;
+}
+
+}  // namespace tarnwell::engine

@@ -1,0 +1,271 @@
+// The writer's files must read the same in libesedb's tools (esedbinfo,
+// esedbexport from Debian's libesedb-utils), an ESE reader written without
+// any of our code.
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cinttypes>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <ctime>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+#include <string>
+
+#include "testing/ese_writer.h"
+#include "testing/forge_catalog.h"
+#include "testing/forge_record.h"
+#include "testing/forge_sample.h"
+
+namespace tarnwell::forge {
+namespace {
+
+namespace fs = std::filesystem;
+
+bool HaveTool(const char* name) {
+  std::string cmd = std::string("command -v ") + name + " >/dev/null 2>&1";
+  return std::system(cmd.c_str()) == 0;
+}
+
+int RunTool(const std::string& cmd, const std::string& log) {
+  return std::system((cmd + " >" + log + " 2>&1 </dev/null").c_str());
+}
+
+std::string ReadText(const fs::path& path) {
+  std::ifstream in(path, std::ios::binary);
+  std::stringstream ss;
+  ss << in.rdbuf();
+  return ss.str();
+}
+
+std::string Hex(const Bytes& b) { return ToHex(ByteView(b)); }
+
+uint64_t Le(const Bytes& b) {
+  uint64_t v = 0;
+  for (size_t i = b.size(); i-- > 0;) v = (v << 8) | b[i];
+  return v;
+}
+
+// libfdatetime's FILETIME text: "Jun 15, 2013 17:00:00.000000000" (UTC).
+std::string FiletimeText(uint64_t filetime) {
+  constexpr uint64_t kTicksPerSecond = 10000000;
+  constexpr int64_t kUnixEpochSeconds = 11644473600;
+  time_t unix_seconds = time_t(int64_t(filetime / kTicksPerSecond) - kUnixEpochSeconds);
+  std::tm tm{};
+  gmtime_r(&unix_seconds, &tm);
+  char date[64];
+  std::strftime(date, sizeof date, "%b %d, %Y %H:%M:%S", &tm);
+  char nanos[16];
+  std::snprintf(nanos, sizeof nanos, ".%09" PRIu64, (filetime % kTicksPerSecond) * 100);
+  return std::string(date) + nanos;
+}
+
+std::string Utf16ToUtf8(const Bytes& b) {
+  std::string out;
+  for (size_t i = 0; i + 1 < b.size(); i += 2) {
+    uint16_t c = LoadU16LE(&b[i]);
+    if (c < 0x80) {
+      out += char(c);
+    } else if (c < 0x800) {
+      out += char(0xC0 | (c >> 6));
+      out += char(0x80 | (c & 0x3F));
+    } else {
+      out += char(0xE0 | (c >> 12));
+      out += char(0x80 | ((c >> 6) & 0x3F));
+      out += char(0x80 | (c & 0x3F));
+    }
+  }
+  return out;
+}
+
+// How esedbexport 20181229 prints a value of each column type.
+std::string ExportText(const ColumnSpec& column, const Bytes& v) {
+  char buf[64];
+  switch (column.type) {
+    case kColumnBit:
+      return v[0] ? "true" : "false";
+    case kColumnUnsignedByte:
+    case kColumnUnsignedShort:
+    case kColumnUnsignedLong:
+      return std::to_string(Le(v));
+    case kColumnShort:
+      return std::to_string(int16_t(Le(v)));
+    case kColumnLong:
+      return std::to_string(int32_t(Le(v)));
+    case kColumnLongLong:
+      return std::to_string(int64_t(Le(v)));
+    case kColumnCurrency:
+      return std::to_string(Le(v));  // printed unsigned
+    case kColumnFloat:
+      // libesedb 20181229 loses 32-bit floats on the way to printf: every one
+      // prints as zero. The bytes are checked by our own reader's tests.
+      return "0.000000";
+    case kColumnDouble: {
+      double d;
+      uint64_t bits = Le(v);
+      std::memcpy(&d, &bits, sizeof d);
+      std::snprintf(buf, sizeof buf, "%f", d);
+      return buf;
+    }
+    case kColumnDateTime:
+      return FiletimeText(Le(v));
+    case kColumnText:
+    case kColumnLongText:
+      return column.codepage == 1200 ? Utf16ToUtf8(v) : std::string(v.begin(), v.end());
+    default:
+      return Hex(v);
+  }
+}
+
+std::string ExpectedExport(const TableSpec& table) {
+  std::string out;
+  for (size_t i = 0; i < table.columns.size(); ++i) {
+    out += (i ? "\t" : "") + table.columns[i].name;
+  }
+  out += "\n";
+  for (const RowSpec& row : table.rows) {
+    if (row.deleted) continue;
+    for (size_t i = 0; i < table.columns.size(); ++i) {
+      if (i) out += "\t";
+      for (const Cell& cell : row.cells) {
+        if (cell.column_id == table.columns[i].id && cell.value) {
+          out += ExportText(table.columns[i], *cell.value);
+        }
+      }
+    }
+    out += "\n";
+  }
+  return out;
+}
+
+struct ExportCase {
+  uint32_t page_size;
+  uint32_t revision;
+  uint32_t rows;
+  uint32_t rows_per_leaf;  // 0: full pages
+  uint32_t children_per_branch;
+};
+
+class EsedbExportTest : public ::testing::TestWithParam<ExportCase> {
+ protected:
+  void SetUp() override {
+    if (!HaveTool("esedbexport") || !HaveTool("esedbinfo")) {
+      GTEST_SKIP() << "esedbinfo/esedbexport (Debian libesedb-utils) not installed";
+    }
+    const ExportCase& c = GetParam();
+    dir_ = fs::path(::testing::TempDir()) /
+           ("forge_esedb_" + std::to_string(getpid()) + "_" + std::to_string(c.page_size) + "_" +
+            std::to_string(c.revision) + "_" + std::to_string(c.rows));
+    fs::remove_all(dir_);
+    fs::create_directories(dir_);
+  }
+  void TearDown() override {
+    if (!dir_.empty() && !HasFailure()) fs::remove_all(dir_);
+  }
+  fs::path dir_;
+};
+
+TEST_P(EsedbExportTest, LibesedbExportsWhatWasWritten) {
+  const ExportCase& c = GetParam();
+  SampleOptions options;
+  options.page_size = c.page_size;
+  options.revision = c.revision;
+  options.rows = c.rows;
+  options.max_rows_per_leaf = c.rows_per_leaf;
+  options.max_children_per_branch = c.children_per_branch;
+  DatabaseSpec spec = SampleDatabase(options);
+  if (c.revision <= 2) {
+    // libesedb 20181229 reads only the first of several revision-2 tagged
+    // values correctly, so keep one per row there.
+    for (RowSpec& row : spec.tables[0].rows) {
+      bool has_body = false;
+      for (const Cell& cell : row.cells) has_body |= cell.column_id == 256;
+      if (has_body)
+        std::erase_if(row.cells, [](const Cell& cell) { return cell.column_id == 257; });
+    }
+  }
+  const fs::path edb = dir_ / "sample.edb";
+  Manifest manifest;
+  ASSERT_TRUE(WriteDatabase(spec, edb.string(), &manifest).ok());
+  if (c.rows_per_leaf) {
+    EXPECT_GT(manifest.tables[0].branch_pages.size(), 1u) << "want several branch levels";
+  }
+
+  const fs::path info_log = dir_ / "esedbinfo.log";
+  ASSERT_EQ(RunTool("esedbinfo '" + edb.string() + "'", info_log.string()), 0)
+      << ReadText(info_log);
+  const std::string info = ReadText(info_log);
+  EXPECT_NE(info.find("Page size:\t\t" + std::to_string(c.page_size) + " bytes"), std::string::npos)
+      << info;
+  EXPECT_NE(info.find("Number of tables:\t" + std::to_string(spec.tables.size() + 2)),
+            std::string::npos)
+      << info;
+
+  const fs::path prefix = dir_ / "out";
+  const fs::path export_log = dir_ / "esedbexport.log";
+  ASSERT_EQ(RunTool("esedbexport -t '" + prefix.string() + "' '" + edb.string() + "'",
+                    export_log.string()),
+            0)
+      << ReadText(export_log);
+  const fs::path exported = dir_ / "out.export";
+
+  // Tables come out in object id order: the catalog and its shadow first.
+  for (size_t t = 0; t < spec.tables.size(); ++t) {
+    const fs::path file = exported / (spec.tables[t].name + "." + std::to_string(t + 2));
+    ASSERT_TRUE(fs::exists(file)) << file;
+    EXPECT_EQ(ReadText(file), ExpectedExport(spec.tables[t])) << spec.tables[t].name;
+  }
+
+  // The catalog lists every table and column by name, and the shadow agrees.
+  const std::string catalog = ReadText(exported / "MSysObjects.0");
+  EXPECT_EQ(catalog, ReadText(exported / "MSysObjectsShadow.1"));
+  auto split = [](const std::string& text) {
+    std::vector<std::string> fields;
+    std::istringstream in(text);
+    std::string field;
+    while (std::getline(in, field, '\t')) fields.push_back(field);
+    return fields;
+  };
+  std::istringstream lines(catalog);
+  std::string line;
+  std::getline(lines, line);
+  const std::vector<std::string> header = split(line);
+  const size_t name_column = std::find(header.begin(), header.end(), "Name") - header.begin();
+  ASSERT_LT(name_column, header.size()) << line;
+  std::vector<std::string> names;
+  while (std::getline(lines, line)) {
+    std::vector<std::string> fields = split(line);
+    names.push_back(name_column < fields.size() ? fields[name_column] : "");
+  }
+  std::vector<std::string> expected = {"MSysObjects"};
+  for (const ColumnSpec& col : CatalogColumns(c.revision)) expected.push_back(col.name);
+  expected.push_back("MSysObjectsShadow");
+  for (const ColumnSpec& col : CatalogColumns(c.revision)) expected.push_back(col.name);
+  for (const TableSpec& t : spec.tables) {
+    expected.push_back(t.name);
+    for (const ColumnSpec& col : t.columns) expected.push_back(col.name);
+  }
+  EXPECT_EQ(names, expected);
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Exchange, EsedbExportTest,
+    ::testing::Values(ExportCase{4096, 2, 150, 5, 3},   // Exchange 5.5
+                      ExportCase{4096, 9, 300, 4, 3},   // Exchange 2000/2003, deep tree
+                      ExportCase{4096, 9, 2000, 0, 0},  // full pages
+                      ExportCase{8192, 12, 300, 4, 4},  // Exchange 2007
+                      ExportCase{8192, 12, 3000, 0, 0}, ExportCase{16384, 17, 300, 6, 3},
+                      ExportCase{32768, 17, 300, 5, 3},  // Exchange 2010
+                      ExportCase{32768, 17, 6000, 0, 0},
+                      ExportCase{32768, 20, 300, 3, 5}),  // Exchange 2013 and later
+    [](const ::testing::TestParamInfo<ExportCase>& info) {
+      const ExportCase& c = info.param;
+      return std::to_string(c.page_size) + "_rev" + std::to_string(c.revision) + "_" +
+             std::to_string(c.rows) + (c.rows_per_leaf ? "_deep" : "_full");
+    });
+
+}  // namespace
+}  // namespace tarnwell::forge

@@ -1,0 +1,141 @@
+// What the test database writer is asked to build, and what it reports back.
+//
+// A DatabaseSpec is a plain description: tables, their columns and rows, and
+// the page format of one Exchange generation. The writer turns it into an ESE
+// database file; the Manifest says where everything ended up so tests can
+// damage or inspect particular pages.
+#ifndef TARNWELL_TESTING_FORGE_SPEC_H_
+#define TARNWELL_TESTING_FORGE_SPEC_H_
+
+#include <cstddef>
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "base/byte_view.h"
+
+namespace tarnwell::forge {
+
+// ESE column types (JET_coltyp).
+enum ColumnType : uint32_t {
+  kColumnBit = 1,
+  kColumnUnsignedByte = 2,
+  kColumnShort = 3,
+  kColumnLong = 4,
+  kColumnCurrency = 5,
+  kColumnFloat = 6,
+  kColumnDouble = 7,
+  kColumnDateTime = 8,
+  kColumnBinary = 9,
+  kColumnText = 10,
+  kColumnLongBinary = 11,
+  kColumnLongText = 12,
+  kColumnUnsignedLong = 14,
+  kColumnLongLong = 15,
+  kColumnGuid = 16,
+  kColumnUnsignedShort = 17,
+};
+
+// Column identifiers decide how a value is stored, as in ESE itself:
+// 1..127 fixed, 128..255 variable, 256 and up tagged.
+constexpr uint32_t kFirstVariableColumnId = 128;
+constexpr uint32_t kFirstTaggedColumnId = 256;
+constexpr uint32_t kLastTaggedColumnId = 0xFFFF;
+
+// Flag byte bits of a tagged value (written before the value when present).
+constexpr uint8_t kTaggedLongValue = 0x01;
+constexpr uint8_t kTaggedCompressed = 0x02;
+constexpr uint8_t kTaggedSeparated = 0x04;
+constexpr uint8_t kTaggedMultiValued = 0x08;
+constexpr uint8_t kTaggedTwoValues = 0x10;
+constexpr uint8_t kTaggedNull = 0x20;
+
+struct ColumnSpec {
+  uint32_t id = 0;
+  std::string name;
+  uint32_t type = 0;
+  uint32_t size = 0;      // 0: natural width of fixed types; max size for variable ones
+  uint32_t codepage = 0;  // text columns: 1252, 1200 (UTF-16), ...
+  uint32_t flags = 0;     // extra catalog column flags (e.g. 0x400 multi-valued)
+};
+
+struct Cell {
+  uint32_t column_id = 0;
+  std::optional<Bytes> value;  // nullopt: an explicit NULL
+  uint8_t tagged_flags = 0;    // flag byte of a tagged value (kTagged*); 0 = none on small pages
+};
+
+struct RowSpec {
+  std::vector<Cell> cells;
+  bool deleted = false;  // written as a node with the deleted tag flag
+  Bytes key;             // empty: the 4-byte big-endian ordinal of the row (1-based)
+};
+
+struct TableSpec {
+  std::string name;
+  std::vector<ColumnSpec> columns;
+  std::vector<RowSpec> rows;
+  uint32_t max_rows_per_leaf = 0;        // 0: fill pages; small values force deep trees
+  uint32_t max_children_per_branch = 0;  // 0: fill pages
+};
+
+struct DatabaseSpec {
+  uint32_t page_size = 8192;  // 4096, 8192, 16384 or 32768
+  uint32_t format_version = 0x620;
+  uint32_t format_revision = 12;
+  // OR-ed into every page's flags. Unset: what the page size and revision
+  // imply (4 KiB revision 2: 0, other 4 KiB: 0x0800, 8 KiB: 0x2800,
+  // 16/32 KiB: 0xA800).
+  std::optional<uint32_t> page_format_flags;
+  bool prefix_compression = true;
+  uint32_t database_state = 3;  // clean shutdown
+  std::vector<TableSpec> tables;
+};
+
+struct DamageSpec {
+  size_t junk_prefix = 0;          // bytes of junk before the header
+  bool drop_header_pages = false;  // the file starts with page 1
+};
+
+struct TableManifest {
+  std::string name;
+  uint32_t object_id = 0;
+  uint32_t root_page = 0;
+  std::vector<uint32_t> leaf_pages;    // non-root leaves, left to right
+  std::vector<uint32_t> branch_pages;  // non-root branch pages
+};
+
+struct Manifest {
+  uint32_t page_size = 0;
+  uint64_t total_pages = 0;             // database pages, header blocks not counted
+  std::vector<uint32_t> written_pages;  // pages with content (the others are all zero)
+  std::vector<TableManifest> tables;    // user tables, then MSysObjects and its shadow
+};
+
+// Page flags used by the writer and by tests that check them.
+constexpr uint32_t kPageFlagRoot = 0x0001;
+constexpr uint32_t kPageFlagLeaf = 0x0002;
+constexpr uint32_t kPageFlagParentOfLeaf = 0x0004;
+constexpr uint32_t kPageFlagEmpty = 0x0008;
+constexpr uint32_t kPageFlagSpaceTree = 0x0020;
+constexpr uint32_t kPageFlagIndex = 0x0040;
+constexpr uint32_t kPageFlagLongValue = 0x0080;
+constexpr uint32_t kPageFlagNewRecordFormat = 0x0800;
+constexpr uint32_t kPageFlagNewChecksum = 0x2000;
+constexpr uint32_t kPageFlagLargePageWriter = 0x8000;
+
+// Fixed page numbers every ESE database uses.
+constexpr uint32_t kDatabaseRootPage = 1;
+constexpr uint32_t kDatabaseOwnedSpacePage = 2;
+constexpr uint32_t kDatabaseAvailableSpacePage = 3;
+constexpr uint32_t kCatalogRootPage = 4;
+constexpr uint32_t kShadowCatalogRootPage = 24;
+
+constexpr uint32_t kDatabaseObjectId = 1;
+constexpr uint32_t kCatalogObjectId = 2;
+constexpr uint32_t kShadowCatalogObjectId = 3;
+
+}  // namespace tarnwell::forge
+
+#endif  // TARNWELL_TESTING_FORGE_SPEC_H_
