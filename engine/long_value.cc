@@ -3,9 +3,35 @@
 #include <algorithm>
 
 #include "engine/compress/compressed_value.h"
+#include "engine/compress/seven_bit.h"
 #include "engine/tree_cursor.h"
 
 namespace tarnwell::engine {
+
+namespace {
+
+constexpr size_t kCompressedSizeOffset = 1;
+
+// The decoded size a compressed chunk announces; nothing when the bytes do
+// not start like a compressed value this program can size.
+std::optional<uint64_t> DeclaredSize(ByteView chunk) {
+  switch (SchemeOf(chunk)) {
+    case CompressionScheme::kXpress:
+    case CompressionScheme::kLz4: {
+      uint16_t size = 0;
+      if (!chunk.ReadU16LE(kCompressedSizeOffset, &size)) return std::nullopt;
+      return size;
+    }
+    case CompressionScheme::kSevenBitAscii:
+      return SevenBitCharacterCount(chunk);
+    case CompressionScheme::kSevenBitUnicode:
+      return 2 * uint64_t(SevenBitCharacterCount(chunk));
+    default:
+      return std::nullopt;
+  }
+}
+
+}  // namespace
 
 int LongValueReader::Read(uint32_t root_page, ByteView id, LongValue* out) const {
   if (id.size() != kLongValueIdSize && id.size() != kLongValueId64Size) return -1;
@@ -23,6 +49,7 @@ int LongValueReader::Read(uint32_t root_page, ByteView id, LongValue* out) const
     uint64_t offset;
     int64_t position;
     uint32_t size;
+    std::optional<uint64_t> declared;  // decoded size, if it reads as compressed
   };
   std::vector<Found> found;
   while (cursor.Next()) {
@@ -32,7 +59,8 @@ int LongValueReader::Read(uint32_t root_page, ByteView id, LongValue* out) const
       break;
     }
     found.push_back({LoadU32BE(k.data() + key.size()), cursor.data_position(),
-                     uint32_t(cursor.data().size())});
+                     uint32_t(cursor.data().size()),
+                     compressible_ ? DeclaredSize(cursor.data()) : std::nullopt});
   }
 
   for (size_t i = 0; i < found.size(); ++i) {
@@ -42,10 +70,16 @@ int LongValueReader::Read(uint32_t root_page, ByteView id, LongValue* out) const
       out->truncated = true;                      // a chunk is missing
       break;
     }
+    // The logical bytes this chunk should cover: up to the next chunk, or
+    // to the declared total for the last one.
+    const uint64_t end = i + 1 < found.size() ? found[i + 1].offset : out->declared_size;
+    const uint64_t span = end > f.offset ? end - f.offset : 0;
     uint64_t logical = f.size;
-    if (compressible_) {
-      const uint64_t end = i + 1 < found.size() ? found[i + 1].offset : out->declared_size;
-      if (end > f.offset && end - f.offset > f.size) logical = end - f.offset;
+    // Stored shorter than its span: compressed, when the bytes say so and
+    // their decoded size fits the span. A decoded size short of the span
+    // means the next chunk is missing.
+    if (span > f.size && f.declared && *f.declared > f.size && *f.declared <= span) {
+      logical = *f.declared;
     }
     LongValueChunk chunk;
     chunk.file_position = f.position;
@@ -55,6 +89,10 @@ int LongValueReader::Read(uint32_t root_page, ByteView id, LongValue* out) const
     chunk.compressed = logical != f.size;
     out->chunks.push_back(chunk);
     out->total_size += logical;
+    if (i + 1 < found.size() && out->total_size < found[i + 1].offset) {
+      out->truncated = true;  // the chunk after this one is missing
+      break;
+    }
   }
   if (out->declared_size && out->total_size < out->declared_size) out->truncated = true;
   return 0;

@@ -20,6 +20,7 @@
 #define TARNWELL_ENGINE_LONG_VALUE_H_
 
 #include <cstdint>
+#include <optional>
 #include <vector>
 
 #include "base/byte_view.h"

@@ -12,6 +12,8 @@
 #include <cstdint>
 #include <optional>
 
+#include "engine/page.h"
+
 namespace tarnwell::engine {
 
 // Which checksum a page carries.
@@ -23,8 +25,6 @@ enum class ChecksumScheme {
 
 // Page flag that selects the XOR/ECC checksum on small pages.
 inline constexpr uint32_t kPageFlagNewChecksum = 0x2000;
-// Byte offset of the u32 page flags in every page header.
-inline constexpr size_t kPageFlagsOffset = 36;
 
 ChecksumScheme SchemeForPage(size_t page_size, uint32_t page_flags);
 
