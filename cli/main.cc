@@ -5,6 +5,7 @@
 
 #include "cli/dump_command.h"
 #include "cli/info_command.h"
+#include "cli/store_commands.h"
 #include "cli/tables_command.h"
 #include "cli/terminal_progress.h"
 
@@ -50,6 +51,39 @@ int RunDump(const std::string& path, const std::string& table, bool json) {
   return 0;
 }
 
+void AddScanOptions(CLI::App* cmd, tarnwell::cli::ScanOptions* o) {
+  cmd->add_option("DB", o->db, "database file")->required();
+  cmd->add_option("--version", o->version, "auto, 5.5, 2000, 2003, 2007, 2010 or 2013");
+  cmd->add_option("--mode", o->mode, "standard or advance");
+  cmd->add_option("--stm", o->stm, "the streaming file of an Exchange 2000/2003 database");
+  cmd->add_option("--temp", o->temp, "temporary folder (default: a fresh one, removed at the end)");
+  cmd->add_flag("--adjust", o->adjust, "handle alignment errors: find where the database starts");
+}
+
+int Fail(const std::string& path, const tarnwell::Status& s) {
+  std::fprintf(stderr, "tarnwell: %s: %s\n", path.c_str(), s.message().c_str());
+  return 1;
+}
+
+int RunStore(const tarnwell::cli::ScanOptions& o, const std::string& command,
+             const std::string& ref, size_t item, bool json) {
+  tarnwell::cli::TerminalProgress progress;
+  tarnwell::cli::StoreSession session;
+  tarnwell::Status s = session.Open(o, progress);
+  if (!s.ok()) return Fail(o.db, s);
+  std::string out;
+  if (command == "scan") {
+    out = json ? tarnwell::cli::FormatScanJson(session, o) : tarnwell::cli::FormatScanText(session);
+  } else if (command == "list") {
+    s = tarnwell::cli::RunList(session, ref, json, &out);
+  } else {
+    s = tarnwell::cli::RunShow(session, ref, item, json, &out);
+  }
+  if (!s.ok()) return Fail(o.db, s);
+  std::fwrite(out.data(), 1, out.size(), stdout);
+  return 0;
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
@@ -75,7 +109,27 @@ int main(int argc, char** argv) {
   dump->add_option("TABLE", dump_table, "table name")->required();
   dump->add_flag("--json", dump_json, "print JSON");
 
+  tarnwell::cli::ScanOptions scan_options, list_options, show_options;
+  bool scan_json = false, list_json = false, show_json = false;
+  std::string list_ref, show_ref;
+  size_t show_item = 0;
+  CLI::App* scan = app.add_subcommand("scan", "Scan a mailbox database and print its folder tree");
+  AddScanOptions(scan, &scan_options);
+  scan->add_flag("--json", scan_json, "print JSON");
+  CLI::App* list = app.add_subcommand("list", "List the items of a folder");
+  AddScanOptions(list, &list_options);
+  list->add_option("--folder", list_ref, "folder reference from `scan`")->required();
+  list->add_flag("--json", list_json, "print JSON");
+  CLI::App* show = app.add_subcommand("show", "Show one decoded item of a folder");
+  AddScanOptions(show, &show_options);
+  show->add_option("--folder", show_ref, "folder reference from `scan`")->required();
+  show->add_option("--item", show_item, "item number in the folder's list, from 1")->required();
+  show->add_flag("--json", show_json, "print JSON");
+
   CLI11_PARSE(app, argc, argv);
+  if (scan->parsed()) return RunStore(scan_options, "scan", "", 0, scan_json);
+  if (list->parsed()) return RunStore(list_options, "list", list_ref, 0, list_json);
+  if (show->parsed()) return RunStore(show_options, "show", show_ref, show_item, show_json);
   if (dump->parsed()) return RunDump(dump_path, dump_table, dump_json);
   if (info->parsed()) return RunInfo(info_path, info_json);
   if (tables->parsed()) return RunTables(tables_path, tables_json);

@@ -35,6 +35,7 @@
 namespace tarnwell::engine {
 
 constexpr uint32_t kCatalogRootPage = 4;
+constexpr uint32_t kCatalogObjectId = 2;  // MSysObjects
 constexpr uint8_t kCatalogMinLastFixed = 5;
 constexpr uint8_t kCatalogExtendedLastFixed = 12;
 constexpr uint8_t kCatalogMaxLastFixed = 127;

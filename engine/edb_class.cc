@@ -159,6 +159,15 @@ int EdbClass::ParseCatalogRecords() {
   progress_->Range(0, kPermille);
   progress_->Position(0);
   CatalogBuilder builder;
+  // The harvest of Advance Mode brings the leaf records of every tree in the
+  // file; only those on pages of the catalog's own tree are catalog records.
+  // (Other tables' records can look like catalog records and would file
+  // bogus columns under the last table.)
+  uint32_t catalog_object = kCatalogObjectId;
+  Page root;
+  if (ReadPage(kCatalogRootPage, &root) && root.is_root() && root.header().object_id != 0) {
+    catalog_object = root.header().object_id;
+  }
   // References come grouped by page: keep the last page read.
   Page page;
   uint32_t page_number = 0;
@@ -168,7 +177,7 @@ int EdbClass::ParseCatalogRecords() {
     const RecordRef& ref = records_[k];
     if (!page_ok || ref.page_number != page_number) {
       page_number = ref.page_number;
-      page_ok = ReadPage(page_number, &page);
+      page_ok = ReadPage(page_number, &page) && page.header().object_id == catalog_object;
     }
     if (!page_ok || ref.tag_index >= page.nodes().size()) continue;
     const NodeEntry& node = page.nodes()[ref.tag_index];

@@ -113,11 +113,11 @@ TEST(EseWriterTest, DamageMovesOrDropsTheHeader) {
   Bytes clean = BuildDatabase(spec, &manifest);
   ASSERT_FALSE(clean.empty());
 
-  Bytes junk = BuildDatabase(spec, nullptr, {1000, false});
+  Bytes junk = BuildDatabase(spec, nullptr, {1000, false, {}});
   ASSERT_EQ(junk.size(), clean.size() + 1000);
   EXPECT_TRUE(std::equal(clean.begin(), clean.end(), junk.begin() + 1000));
 
-  Bytes headless = BuildDatabase(spec, nullptr, {0, true});
+  Bytes headless = BuildDatabase(spec, nullptr, {0, true, {}});
   ASSERT_EQ(headless.size(), clean.size() - 2 * 4096);
   EXPECT_TRUE(std::equal(headless.begin(), headless.end(), clean.begin() + 2 * 4096));
   EXPECT_EQ(LoadU32LE(headless.data() + 36), 0x0803u) << "file should start with page 1";

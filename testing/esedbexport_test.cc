@@ -19,6 +19,7 @@
 #include "testing/forge_catalog.h"
 #include "testing/forge_record.h"
 #include "testing/forge_sample.h"
+#include "testing/forge_value.h"
 
 namespace tarnwell::forge {
 namespace {
@@ -266,6 +267,83 @@ INSTANTIATE_TEST_SUITE_P(
       return std::to_string(c.page_size) + "_rev" + std::to_string(c.revision) + "_" +
              std::to_string(c.rows) + (c.rows_per_leaf ? "_deep" : "_full");
     });
+
+// Long values as libesedb 20181229 can read them back. It finds a long-value
+// node only when the node's whole key is its page's common key prefix, and
+// under a branch it searches only the first two leaves; so the layout it
+// reads is one value of one chunk per table, in an LV tree of two leaves
+// (root node, chunk) that each hold one prefix-only node. Our own reader is
+// tested on the general layouts in engine/long_value_test.cc.
+struct LongValueExportCase {
+  uint32_t page_size;
+  uint32_t revision;
+};
+
+class EsedbExportLongValueTest : public ::testing::TestWithParam<LongValueExportCase> {
+ protected:
+  void SetUp() override {
+    if (!HaveTool("esedbexport")) GTEST_SKIP() << "esedbexport (libesedb-utils) not installed";
+    dir_ = fs::path(::testing::TempDir()) / ("forge_esedb_lv_" + std::to_string(getpid()) + "_" +
+                                             std::to_string(GetParam().page_size));
+    fs::remove_all(dir_);
+    fs::create_directories(dir_);
+  }
+  void TearDown() override {
+    if (!dir_.empty() && !HasFailure()) fs::remove_all(dir_);
+  }
+  fs::path dir_;
+};
+
+TEST_P(EsedbExportLongValueTest, LibesedbExportsTheLongValuesBytes) {
+  const LongValueExportCase& c = GetParam();
+  DatabaseSpec spec;
+  spec.page_size = c.page_size;
+  spec.format_revision = c.revision;
+  std::vector<Bytes> values;
+  for (uint32_t t = 0; t < 3; ++t) {
+    TableSpec table;
+    table.name = "Attachments" + std::to_string(t + 1);
+    table.columns = {{1, "Id", kColumnLong}, {256, "Data", kColumnLongBinary}};
+    table.max_long_value_nodes_per_leaf = 1;
+    table.long_value_full_leaf_prefix = true;
+    LongValueSpec lv;
+    lv.id = 0x10203 + t;  // several key bytes, not only the last, must come out right
+    for (uint32_t i = 0; i < 900 + 50 * t; ++i) lv.data.push_back(uint8_t(i * 13 + t));
+    values.push_back(lv.data);
+    RowSpec with_lv;
+    with_lv.cells = {{1, LittleEndian(1, 4)}, SeparatedCell(256, lv.id)};
+    RowSpec inline_value;
+    inline_value.cells = {{1, LittleEndian(2, 4)}, {256, Bytes{0xCA, 0xFE}}};
+    table.rows = {with_lv, inline_value};
+    table.long_values.push_back(std::move(lv));
+    spec.tables.push_back(std::move(table));
+  }
+  const fs::path edb = dir_ / "lv.edb";
+  Manifest manifest;
+  ASSERT_TRUE(WriteDatabase(spec, edb.string(), &manifest).ok());
+  for (const TableManifest& m : manifest.tables) {
+    if (m.name.rfind("Attachments", 0) != 0) continue;
+    EXPECT_EQ(m.long_value_leaf_pages.size(), 2u) << "the layout libesedb reads";
+  }
+
+  const fs::path prefix = dir_ / "out";
+  const fs::path log = dir_ / "esedbexport.log";
+  ASSERT_EQ(
+      RunTool("esedbexport -t '" + prefix.string() + "' '" + edb.string() + "'", log.string()), 0)
+      << ReadText(log);
+  for (size_t t = 0; t < spec.tables.size(); ++t) {
+    const fs::path file = dir_ / "out.export" / (spec.tables[t].name + "." + std::to_string(t + 2));
+    EXPECT_EQ(ReadText(file), "Id\tData\n1\t" + Hex(values[t]) + "\n2\tcafe\n") << file;
+  }
+}
+
+INSTANTIATE_TEST_SUITE_P(PageSizes, EsedbExportLongValueTest,
+                         ::testing::Values(LongValueExportCase{4096, 9},
+                                           LongValueExportCase{8192, 12},
+                                           LongValueExportCase{32768, 17}),
+                         [](const ::testing::TestParamInfo<LongValueExportCase>& info) {
+                           return std::to_string(info.param.page_size);
+                         });
 
 }  // namespace
 }  // namespace tarnwell::forge

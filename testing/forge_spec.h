@@ -51,6 +51,18 @@ constexpr uint8_t kTaggedMultiValued = 0x08;
 constexpr uint8_t kTaggedTwoValues = 0x10;
 constexpr uint8_t kTaggedNull = 0x20;
 
+// How a value is compressed: in a record (flag kTaggedCompressed) or as a
+// long-value chunk. kXpress9 stands for the schemes the reader does not
+// decode: its value carries the right header byte over filler.
+enum class Compression : uint8_t {
+  kNone,
+  kSevenBitAscii,
+  kSevenBitUnicode,
+  kXpress,
+  kXpress9,
+  kLz4,
+};
+
 struct ColumnSpec {
   uint32_t id = 0;
   std::string name;
@@ -72,12 +84,31 @@ struct RowSpec {
   Bytes key;             // empty: the 4-byte big-endian ordinal of the row (1-based)
 };
 
+// A value of the table's long-value tree. Records refer to it by id through
+// a separated tagged value (see SeparatedCell in forge_value.h).
+struct LongValueSpec {
+  uint64_t id = 0;  // unique within the table, 1 and up
+  Bytes data;
+  uint32_t reference_count = 1;
+  // Each chunk is compressed on its own; a chunk the scheme does not shrink
+  // is stored as it is, the way ESE does.
+  Compression compression = Compression::kNone;
+};
+
 struct TableSpec {
   std::string name;
   std::vector<ColumnSpec> columns;
   std::vector<RowSpec> rows;
   uint32_t max_rows_per_leaf = 0;        // 0: fill pages; small values force deep trees
   uint32_t max_children_per_branch = 0;  // 0: fill pages
+
+  // The long-value tree; written (with its catalog record) when not empty.
+  std::vector<LongValueSpec> long_values;
+  uint32_t long_value_id_size = 4;             // 4, or 8 as newer revisions have it
+  uint32_t long_value_chunk_size = 0;          // 0: DefaultLongValueChunkSize
+  uint32_t max_long_value_nodes_per_leaf = 0;  // 0: fill pages
+  uint32_t max_long_value_children_per_branch = 0;
+  bool long_value_full_leaf_prefix = false;  // see TreeOptions::full_leaf_prefix
 };
 
 struct DatabaseSpec {
@@ -93,9 +124,17 @@ struct DatabaseSpec {
   std::vector<TableSpec> tables;
 };
 
+// One chunk of one long value left out of its tree.
+struct DroppedChunk {
+  std::string table;
+  uint64_t long_value_id = 0;
+  uint32_t chunk = 0;  // 0-based, in offset order
+};
+
 struct DamageSpec {
   size_t junk_prefix = 0;          // bytes of junk before the header
   bool drop_header_pages = false;  // the file starts with page 1
+  std::vector<DroppedChunk> dropped_chunks;
 };
 
 struct TableManifest {
@@ -104,6 +143,13 @@ struct TableManifest {
   uint32_t root_page = 0;
   std::vector<uint32_t> leaf_pages;    // non-root leaves, left to right
   std::vector<uint32_t> branch_pages;  // non-root branch pages
+  // The long-value tree, when the table has one (root page 0 otherwise).
+  uint32_t long_value_object_id = 0;
+  uint32_t long_value_root_page = 0;
+  std::vector<uint32_t> long_value_leaf_pages;
+  std::vector<uint32_t> long_value_branch_pages;
+  uint64_t long_value_chunks = 0;
+  uint64_t compressed_chunks = 0;  // chunks stored in fewer bytes than they hold
 };
 
 struct Manifest {

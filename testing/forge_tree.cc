@@ -128,7 +128,7 @@ PageValue EncodeNode(const Item& item, size_t prefix) {
 
 Status WritePage(const PageFormat& format, const PageHeaderFields& header, const Bytes& tag0,
                  const std::vector<Item>& items, size_t begin, size_t end, size_t prefix,
-                 PageMap* pages) {
+                 PageSink* sink) {
   std::vector<PageValue> values;
   values.push_back({tag0, 0});
   for (size_t i = begin; i < end; ++i) values.push_back(EncodeNode(items[i], prefix));
@@ -136,8 +136,7 @@ Status WritePage(const PageFormat& format, const PageHeaderFields& header, const
   if (!LayoutPage(format, header, values, image.data())) {
     return Status::InvalidArgument("page " + std::to_string(header.page_number) + " overflows");
   }
-  (*pages)[header.page_number] = std::move(image);
-  return Status::Ok();
+  return sink->Put(header.page_number, std::move(image));
 }
 
 Bytes ChildPage(uint32_t page) {
@@ -163,92 +162,165 @@ Bytes RootPageHeader(uint32_t initial_pages, uint32_t parent_fdp_page, uint32_t 
   return b;
 }
 
-Status BuildTree(const PageFormat& format, const TreeOptions& options,
-                 const std::vector<TreeEntry>& entries, PageAllocator* allocator, PageMap* pages,
-                 TreeLayout* layout) {
-  *layout = TreeLayout();
-  layout->root_page = options.root_page;
-  for (size_t i = 1; i < entries.size(); ++i) {
-    if (!(entries[i - 1].key < entries[i].key)) {
-      return Status::InvalidArgument("tree keys must be unique and ascending");
+TreeWriter::TreeWriter(const PageFormat& format, const TreeOptions& options,
+                       PageAllocator* allocator, PageSink* sink)
+    : format_(format), options_(options), allocator_(allocator), sink_(sink) {
+  layout_.root_page = options.root_page;
+}
+
+Status TreeWriter::Add(TreeEntry entry) {
+  if (!status_.ok()) return status_;
+  if (entries_ > 0 && !(last_key_ < entry.key)) {
+    return status_ = Status::InvalidArgument("tree keys must be unique and ascending");
+  }
+  const size_t item_plain = kKeyLengthSize + entry.key.size() + entry.data.size();
+  if (!pending_.empty()) {
+    const size_t count = pending_.size();
+    bool full = options_.max_entries_per_leaf != 0 && count == options_.max_entries_per_leaf;
+    if (!full) {
+      const Bytes& first = pending_.front().key;
+      const size_t plain = pending_plain_ + item_plain;
+      const size_t lcp =
+          SafePrefix(format_, first, std::min(pending_lcp_, CommonPrefix(first, entry.key)));
+      const size_t prefix = options_.prefix_compression ? UsefulPrefix(count + 1, plain, lcp) : 0;
+      full = PageCost(count + 1, plain, prefix, 0) > format_.value_space();
+    }
+    if (full) {
+      if (pending_page_ == 0) pending_page_ = allocator_->Allocate();
+      const uint32_t next = allocator_->Allocate();
+      status_ = FlushLeaf(next);
+      if (!status_.ok()) return status_;
+      pending_page_ = next;
     }
   }
-  PageHeaderFields header;
-  header.object_id = options.object_id;
-  header.db_time = options.db_time;
+  if (pending_.empty()) {
+    if (PageCost(1, item_plain, 0, 0) > format_.value_space()) {
+      return status_ = Status::InvalidArgument("an entry of " + std::to_string(entry.data.size()) +
+                                               " bytes does not fit in a " +
+                                               std::to_string(format_.page_size) + "-byte page");
+    }
+    pending_lcp_ = SafePrefix(format_, entry.key, entry.key.size());
+  } else {
+    const Bytes& first = pending_.front().key;
+    pending_lcp_ =
+        SafePrefix(format_, first, std::min(pending_lcp_, CommonPrefix(first, entry.key)));
+  }
+  pending_plain_ += item_plain;
+  last_key_ = entry.key;
+  ++entries_;
+  pending_.push_back(std::move(entry));
+  return Status::Ok();
+}
 
+Status TreeWriter::FlushLeaf(uint32_t next_page) {
   std::vector<Item> items;
-  items.reserve(entries.size());
-  for (const TreeEntry& e : entries) items.push_back({&e.key, e.data, e.deleted});
-
-  if (FitsInRoot(format, items, options.max_entries_per_leaf, options.root_header.size())) {
-    header.page_number = options.root_page;
-    header.flags = options.kind_flags | kPageFlagRoot | kPageFlagLeaf;
-    return WritePage(format, header, options.root_header, items, 0, items.size(), 0, pages);
+  items.reserve(pending_.size());
+  for (TreeEntry& e : pending_) items.push_back({&e.key, std::move(e.data), e.deleted});
+  size_t prefix = 0;
+  if (options_.full_leaf_prefix) {
+    prefix = pending_lcp_;
+  } else if (options_.prefix_compression) {
+    prefix = UsefulPrefix(items.size(), pending_plain_, pending_lcp_);
   }
-
-  // Leaves, chained left to right.
-  std::vector<PageRun> runs;
-  Status s =
-      PackRuns(format, items, options.max_entries_per_leaf, options.prefix_compression, &runs);
+  PageHeaderFields header;
+  header.object_id = options_.object_id;
+  header.db_time = options_.db_time;
+  header.page_number = pending_page_;
+  header.previous_page = previous_leaf_;
+  header.next_page = next_page;
+  header.flags = options_.kind_flags | kPageFlagLeaf;
+  Bytes tag0(pending_.front().key.begin(), pending_.front().key.begin() + prefix);
+  Status s = WritePage(format_, header, tag0, items, 0, items.size(), prefix, sink_);
   if (!s.ok()) return s;
-  std::vector<uint32_t> numbers;
-  for (size_t r = 0; r < runs.size(); ++r) numbers.push_back(allocator->Allocate());
-  // Highest key below each page; `rightmost` marks the tree's open end.
-  struct Child {
-    uint32_t page;
-    const Bytes* max_key;
-  };
-  std::vector<Child> children;
-  for (size_t r = 0; r < runs.size(); ++r) {
-    const PageRun& run = runs[r];
-    header.page_number = numbers[r];
-    header.previous_page = r > 0 ? numbers[r - 1] : 0;
-    header.next_page = r + 1 < runs.size() ? numbers[r + 1] : 0;
-    header.flags = options.kind_flags | kPageFlagLeaf;
-    Bytes prefix(items[run.begin].key->begin(), items[run.begin].key->begin() + run.prefix);
-    s = WritePage(format, header, prefix, items, run.begin, run.end, run.prefix, pages);
-    if (!s.ok()) return s;
-    layout->leaf_pages.push_back(numbers[r]);
-    children.push_back({numbers[r], items[run.end - 1].key});
-  }
+  layout_.leaf_pages.push_back(pending_page_);
+  children_.push_back({pending_page_, pending_.back().key});
+  previous_leaf_ = pending_page_;
+  pending_.clear();
+  pending_plain_ = pending_lcp_ = 0;
+  return Status::Ok();
+}
 
-  // Branch levels until one page, the root, holds them all.
-  uint32_t max_children = options.max_children_per_branch;
+Status TreeWriter::Finish(TreeLayout* layout) {
+  if (!status_.ok()) return status_;
+  if (children_.empty()) {
+    std::vector<Item> items;
+    for (TreeEntry& e : pending_) items.push_back({&e.key, e.data, e.deleted});
+    if (FitsInRoot(format_, items, options_.max_entries_per_leaf, options_.root_header.size())) {
+      PageHeaderFields header;
+      header.object_id = options_.object_id;
+      header.db_time = options_.db_time;
+      header.page_number = options_.root_page;
+      header.flags = options_.kind_flags | kPageFlagRoot | kPageFlagLeaf;
+      status_ = WritePage(format_, header, options_.root_header, items, 0, items.size(), 0, sink_);
+      pending_.clear();
+      if (status_.ok()) *layout = layout_;
+      return status_;
+    }
+    pending_page_ = allocator_->Allocate();
+  }
+  if (!pending_.empty()) {
+    status_ = FlushLeaf(0);
+    if (!status_.ok()) return status_;
+  }
+  status_ = WriteBranches();
+  if (status_.ok()) *layout = layout_;
+  return status_;
+}
+
+// Branch levels until one page, the root, holds them all.
+Status TreeWriter::WriteBranches() {
+  uint32_t max_children = options_.max_children_per_branch;
   if (max_children == 1) max_children = 2;
   static const Bytes kEmptyKey;
-  header.previous_page = header.next_page = 0;
+  PageHeaderFields header;
+  header.object_id = options_.object_id;
+  header.db_time = options_.db_time;
+  std::vector<Child> children = std::move(children_);
   for (bool parent_of_leaf = true;; parent_of_leaf = false) {
     std::vector<Item> level;
     for (size_t c = 0; c < children.size(); ++c) {
       bool last = c + 1 == children.size();
       level.push_back(
-          {last ? &kEmptyKey : children[c].max_key, ChildPage(children[c].page), false});
+          {last ? &kEmptyKey : &children[c].max_key, ChildPage(children[c].page), false});
     }
-    const uint32_t level_flags = options.kind_flags | (parent_of_leaf ? kPageFlagParentOfLeaf : 0);
-    if (FitsInRoot(format, level, max_children, options.root_header.size())) {
-      header.page_number = options.root_page;
+    const uint32_t level_flags = options_.kind_flags | (parent_of_leaf ? kPageFlagParentOfLeaf : 0);
+    if (FitsInRoot(format_, level, max_children, options_.root_header.size())) {
+      header.page_number = options_.root_page;
       header.flags = level_flags | kPageFlagRoot;
-      return WritePage(format, header, options.root_header, level, 0, level.size(), 0, pages);
+      return WritePage(format_, header, options_.root_header, level, 0, level.size(), 0, sink_);
     }
-    runs.clear();
-    s = PackRuns(format, level, max_children, options.prefix_compression, &runs);
+    std::vector<PageRun> runs;
+    Status s = PackRuns(format_, level, max_children, options_.prefix_compression, &runs);
     if (!s.ok()) return s;
     if (runs.size() >= level.size()) {
       return Status::InvalidArgument("branch keys too long for a tree to converge");
     }
     std::vector<Child> parents;
     for (const PageRun& run : runs) {
-      header.page_number = allocator->Allocate();
+      header.page_number = allocator_->Allocate();
       header.flags = level_flags;
       Bytes prefix(level[run.begin].key->begin(), level[run.begin].key->begin() + run.prefix);
-      s = WritePage(format, header, prefix, level, run.begin, run.end, run.prefix, pages);
+      s = WritePage(format_, header, prefix, level, run.begin, run.end, run.prefix, sink_);
       if (!s.ok()) return s;
-      layout->branch_pages.push_back(header.page_number);
+      layout_.branch_pages.push_back(header.page_number);
       parents.push_back({header.page_number, children[run.end - 1].max_key});
     }
     children = std::move(parents);
   }
+}
+
+Status BuildTree(const PageFormat& format, const TreeOptions& options,
+                 const std::vector<TreeEntry>& entries, PageAllocator* allocator, PageMap* pages,
+                 TreeLayout* layout) {
+  *layout = TreeLayout();
+  layout->root_page = options.root_page;
+  PageMapSink sink(pages);
+  TreeWriter writer(format, options, allocator, &sink);
+  for (const TreeEntry& e : entries) {
+    Status s = writer.Add(e);
+    if (!s.ok()) return s;
+  }
+  return writer.Finish(layout);
 }
 
 }  // namespace tarnwell::forge

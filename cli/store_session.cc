@@ -1,0 +1,149 @@
+#include "cli/store_session.h"
+
+#include <filesystem>
+#include <map>
+
+#include <fmt/format.h>
+
+#include "base/paths.h"
+#include "engine/version.h"
+
+namespace tarnwell::cli {
+namespace {
+
+namespace fs = std::filesystem;
+
+// Collects the tree the scan shows, with each folder's path of names.
+class CollectingTree : public store::FolderTreeSink {
+ public:
+  CollectingTree(const store::FolderList* folders, std::vector<ShownFolder>* out,
+                 std::string* top_text)
+      : folders_(folders), out_(out), top_text_(top_text) {}
+  void set_folders(const store::FolderList* folders) { folders_ = folders; }
+
+  int64_t AddTopItem(const std::string& text, int, uint64_t) override {
+    *top_text_ = text;
+    paths_[0] = {text};
+    return 0;
+  }
+  int64_t AddFolder(int64_t parent, const std::string& text, int icon,
+                    uint32_t folder_index) override {
+    ShownFolder f;
+    f.index = folder_index;
+    f.icon = icon;
+    f.ref = fmt::format("{:x}", (*folders_)[folder_index].folder_id);
+    f.path = paths_[parent];
+    f.path.push_back(text);
+    const int64_t handle = int64_t(out_->size()) + 1;
+    paths_[handle] = f.path;
+    out_->push_back(std::move(f));
+    return handle;
+  }
+
+ private:
+  const store::FolderList* folders_;
+  std::vector<ShownFolder>* out_;
+  std::string* top_text_;
+  std::map<int64_t, std::vector<std::string>> paths_;
+};
+
+// The folder list lives in the store, which the driver makes: the sink
+// reaches it through the source entry.
+class SourceTree : public store::FolderTreeSink {
+ public:
+  SourceTree(app::SourceEntry* source, std::vector<ShownFolder>* out, std::string* top_text)
+      : source_(source), inner_(nullptr, out, top_text) {}
+  int64_t AddTopItem(const std::string& text, int icon, uint64_t n) override {
+    inner_.set_folders(&source_->store->folders());
+    return inner_.AddTopItem(text, icon, n);
+  }
+  int64_t AddFolder(int64_t parent, const std::string& text, int icon, uint32_t index) override {
+    return inner_.AddFolder(parent, text, icon, index);
+  }
+
+ private:
+  app::SourceEntry* source_;
+  CollectingTree inner_;
+};
+
+}  // namespace
+
+Status ParseVersion(const std::string& text, const std::string& db, int* code) {
+  static const std::map<std::string, int> kNames = {
+      {"5.5", engine::kExchange55},    {"2000", engine::kExchange2000},
+      {"2003", engine::kExchange2000}, {"2007", engine::kExchange2007},
+      {"2010", engine::kExchange2010}, {"2013", engine::kExchange2013}};
+  if (text == "auto") {
+    const int detected = engine::EdbClass::DetectVersion(db);
+    if (detected < 0) return Status::IoError(app::kFileCannotBeOpened);
+    if (detected == 0) return Status::NotSupported(app::kVersionNotDetected);
+    *code = detected;
+    return Status::Ok();
+  }
+  auto it = kNames.find(text);
+  if (it == kNames.end()) {
+    return Status::InvalidArgument("unknown version \"" + text +
+                                   "\" (auto, 5.5, 2000, 2003, 2007, 2010 or 2013)");
+  }
+  *code = it->second;
+  return Status::Ok();
+}
+
+const char* VersionName(int code) {
+  const engine::VersionInfo* v = engine::FindVersion(code);
+  return v ? v->name : "unknown";
+}
+
+StoreSession::~StoreSession() {
+  source_.store.reset();
+  source_.reader.reset();
+  if (own_temp_ && !temp_root_.empty()) {
+    std::error_code ec;
+    fs::remove_all(temp_root_, ec);
+  }
+}
+
+Status StoreSession::Open(const ScanOptions& options, ProgressSink& progress) {
+  int code = 0;
+  Status s = ParseVersion(options.version, options.db, &code);
+  if (!s.ok()) return s;
+  if (code == engine::kExchange2010 || code == engine::kExchange2013) {
+    return Status::NotSupported(std::string(VersionName(code)) +
+                                " mailbox databases are not read yet");
+  }
+  if (options.mode != "standard" && options.mode != "advance") {
+    return Status::InvalidArgument("unknown mode \"" + options.mode + "\" (standard or advance)");
+  }
+  if (options.temp.empty()) {
+    s = MakeTempDir("tarnwell-scan", &temp_root_);
+    if (!s.ok()) return s;
+    own_temp_ = true;
+  } else {
+    temp_root_ = options.temp;
+  }
+  settings_.edb_path = options.db;
+  settings_.stm_path = options.stm;
+  settings_.temp_root = temp_root_;
+  settings_.version_code = code;
+  settings_.mode = options.mode == "advance" ? store::ScanMode::kAdvance : store::ScanMode::kStandard;
+  settings_.adjustment_check = options.adjust ? 1 : 0;
+  constexpr uint64_t kSourceNumber = 1;
+  s = app::OpenSource(settings_, kSourceNumber, progress, &source_);
+  if (!s.ok()) return s;
+  RunningFlag running{true};
+  SourceTree tree(&source_, &folders_, &top_text_);
+  outcome_ = app::RunScan(source_, kSourceNumber, running, progress, tree);
+  if (!outcome_.tree_shown) {
+    return Status::Corruption("no mailbox or public folder tree was found in " + options.db);
+  }
+  return Status::Ok();
+}
+
+const ShownFolder* StoreSession::FindFolder(const std::string& ref) const {
+  for (const ShownFolder& f : folders_) {
+    if (f.ref == ref) return &f;
+  }
+  return nullptr;
+}
+
+}  // namespace tarnwell::cli

@@ -1,0 +1,348 @@
+// Long values read back from databases the test writer builds: many values
+// per table, values of many chunks, LV trees of several levels, 8-byte ids,
+// compressed chunks of every scheme and a value that lost a chunk.
+#include "engine/long_value.h"
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <cstdio>
+#include <filesystem>
+#include <map>
+#include <memory>
+#include <ostream>
+#include <string>
+
+#include "base/paths.h"
+#include "engine/catalog.h"
+#include "engine/column_decoder.h"
+#include "engine/edb_class.h"
+#include "testing/ese_writer.h"
+#include "testing/forge_long_value.h"
+#include "testing/forge_record.h"
+#include "testing/forge_value.h"
+
+namespace tarnwell::engine {
+namespace {
+
+struct Format {
+  const char* name;
+  uint32_t page_size;
+  uint32_t revision;
+};
+
+const Format kFormats[] = {
+    {"4k", 4096, 9},
+    {"8k", 8192, 12},
+    {"32k", 32768, 17},
+};
+
+constexpr uint32_t kIdColumn = 1;
+constexpr uint32_t kDataColumn = 256;
+constexpr uint32_t kNoteColumn = 257;
+
+class TempDatabase {
+ public:
+  TempDatabase(const forge::DatabaseSpec& spec, const forge::DamageSpec& damage = {}) {
+    EXPECT_TRUE(MakeTempDir("tarnwell-lv", &dir_).ok());
+    path_ = dir_ + "/test.edb";
+    Status s = forge::WriteDatabase(spec, path_, &manifest_, damage);
+    EXPECT_TRUE(s.ok()) << s.ToString();
+  }
+  ~TempDatabase() { std::filesystem::remove_all(dir_); }
+  const std::string& path() const { return path_; }
+  const forge::Manifest& manifest() const { return manifest_; }
+
+ private:
+  std::string dir_, path_;
+  forge::Manifest manifest_;
+};
+
+std::unique_ptr<EdbClass> OpenWithCatalog(const std::string& path) {
+  std::unique_ptr<EdbClass> reader;
+  Status s = InspectDatabase(path, &reader);
+  EXPECT_TRUE(s.ok()) << s.ToString();
+  if (!reader) return reader;
+  EXPECT_EQ(reader->CollectTreeRecords(kCatalogRootPage), 1);
+  reader->ParseCatalogRecords();
+  return reader;
+}
+
+// Text-like bytes (ASCII, repetitive enough for Xpress and LZ4), different
+// for every value so that a chunk read from the wrong value shows.
+Bytes TextBytes(uint64_t seed, size_t size) {
+  Bytes out;
+  out.reserve(size + 64);
+  for (uint64_t line = 0; out.size() < size; ++line) {
+    const std::string text = "value " + std::to_string(seed) + " line " + std::to_string(line) +
+                             ": the quick brown fox jumps over the lazy dog\r\n";
+    out.insert(out.end(), text.begin(), text.end());
+  }
+  out.resize(size);
+  return out;
+}
+
+Bytes Utf16Bytes(uint64_t seed, size_t size) {
+  Bytes ascii = TextBytes(seed, size / 2);
+  Bytes out;
+  for (uint8_t c : ascii) {
+    out.push_back(c);
+    out.push_back(0);
+  }
+  return out;
+}
+
+// Equal bytes, or where they part: a whole dump of kilobytes helps nobody.
+::testing::AssertionResult SameBytes(const Bytes& got, const Bytes& want) {
+  const size_t n = std::min(got.size(), want.size());
+  size_t i = 0;
+  while (i < n && got[i] == want[i]) ++i;
+  if (i == n && got.size() == want.size()) return ::testing::AssertionSuccess();
+  return ::testing::AssertionFailure() << got.size() << " bytes where " << want.size()
+                                       << " were written; first difference at " << i;
+}
+
+struct LvCase {
+  const char* name;
+  uint32_t values;
+  size_t size;          // of the first value; the others grow a little
+  uint32_t chunk_size;  // 0: the writer's default
+  uint32_t id_size;
+  forge::Compression compression;
+  uint32_t nodes_per_leaf;  // 0: fill pages
+  uint32_t children_per_branch;
+  bool want_branches;  // the LV tree must have non-root branch pages
+};
+
+const LvCase kLvCases[] = {
+    {"many_small_values", 120, 300, 0, 4, forge::Compression::kNone, 0, 0, false},
+    {"many_chunks", 3, 40000, 700, 4, forge::Compression::kNone, 0, 0, false},
+    {"deep_tree", 6, 9000, 500, 4, forge::Compression::kNone, 3, 3, true},
+    {"page_sized_chunks", 4, 100000, 0, 4, forge::Compression::kNone, 0, 0, false},
+    {"ids_of_8_bytes", 40, 2500, 600, 8, forge::Compression::kNone, 4, 3, true},
+    {"xpress_chunks", 5, 30000, 0, 4, forge::Compression::kXpress, 0, 0, false},
+    {"lz4_chunks", 5, 30000, 0, 4, forge::Compression::kLz4, 0, 0, false},
+    {"seven_bit_ascii_chunks", 5, 12000, 1000, 4, forge::Compression::kSevenBitAscii, 2, 3, true},
+    {"seven_bit_unicode_chunks", 5, 12000, 1000, 8, forge::Compression::kSevenBitUnicode, 0, 0,
+     false},
+};
+
+struct LvParam {
+  Format format;
+  LvCase lv;
+};
+void PrintTo(const LvParam& p, std::ostream* os) { *os << p.format.name << " " << p.lv.name; }
+
+// Records (Id, Data -> long value i, Note: a short in-record value) over
+// long values 1..n, with ids spread so that they are not consecutive.
+forge::DatabaseSpec LongValueDatabase(const Format& f, const LvCase& c) {
+  forge::DatabaseSpec spec;
+  spec.page_size = f.page_size;
+  spec.format_revision = f.revision;
+  forge::TableSpec t;
+  t.name = "Attachments";
+  t.columns = {{kIdColumn, "Id", forge::kColumnLong},
+               {kDataColumn, "Data", forge::kColumnLongBinary},
+               {kNoteColumn, "Note", forge::kColumnLongText, 0, 1252}};
+  t.long_value_id_size = c.id_size;
+  t.long_value_chunk_size = c.chunk_size;
+  t.max_long_value_nodes_per_leaf = c.nodes_per_leaf;
+  t.max_long_value_children_per_branch = c.children_per_branch;
+  for (uint32_t i = 0; i < c.values; ++i) {
+    forge::LongValueSpec v;
+    // 8-byte ids use the high half, which a reader that cuts ids to 4 bytes loses.
+    v.id = c.id_size == 8 ? (uint64_t(i + 1) << 32) + 7 * i + 1 : 3 * i + 2;
+    const size_t size = c.size + 37 * i;
+    v.data = c.compression == forge::Compression::kSevenBitUnicode ? Utf16Bytes(v.id, size)
+                                                                   : TextBytes(v.id, size);
+    v.compression = c.compression;
+    forge::RowSpec row;
+    row.cells.push_back({kIdColumn, forge::LittleEndian(i + 1, 4)});
+    row.cells.push_back(forge::SeparatedCell(kDataColumn, v.id, c.id_size));
+    row.cells.push_back({kNoteColumn, forge::Ascii("note " + std::to_string(i + 1))});
+    t.rows.push_back(std::move(row));
+    t.long_values.push_back(std::move(v));
+  }
+  spec.tables.push_back(std::move(t));
+  return spec;
+}
+
+class LongValueTest : public ::testing::TestWithParam<LvParam> {};
+
+TEST_P(LongValueTest, ReaderAssemblesEveryValue) {
+  const LvParam& p = GetParam();
+  forge::DatabaseSpec spec = LongValueDatabase(p.format, p.lv);
+  TempDatabase db(spec);
+  const forge::TableManifest& m = db.manifest().tables[0];
+  ASSERT_NE(m.long_value_root_page, 0u);
+  if (p.lv.want_branches) {
+    EXPECT_FALSE(m.long_value_branch_pages.empty());
+  }
+  if (p.lv.compression != forge::Compression::kNone) {
+    // All but perhaps a short last chunk of each value shrink.
+    EXPECT_GE(m.compressed_chunks + p.lv.values, m.long_value_chunks);
+    EXPECT_GT(m.compressed_chunks, 0u);
+  }
+
+  auto reader = OpenWithCatalog(db.path());
+  ASSERT_TRUE(reader);
+  const TableDef* table = reader->FindTable("Attachments");
+  ASSERT_NE(table, nullptr);
+  ASSERT_TRUE(table->long_value);
+  EXPECT_EQ(table->long_value->root_page(), m.long_value_root_page);
+
+  // Straight through the long-value reader.
+  const forge::TableSpec& t = spec.tables[0];
+  const uint32_t chunk_size = p.lv.chunk_size
+                                  ? p.lv.chunk_size
+                                  : forge::DefaultLongValueChunkSize(
+                                        {p.format.page_size, p.format.revision, 0}, p.lv.id_size);
+  const LongValueReader lvs = reader->long_values();
+  uint64_t compressed = 0;
+  for (const forge::LongValueSpec& v : t.long_values) {
+    LongValue lv;
+    ASSERT_EQ(lvs.Read(m.long_value_root_page, forge::LongValueId(v.id, p.lv.id_size), &lv), 0)
+        << "id " << v.id;
+    EXPECT_FALSE(lv.truncated) << "id " << v.id;
+    EXPECT_EQ(lv.declared_size, v.data.size());
+    EXPECT_EQ(lv.total_size, v.data.size());
+    EXPECT_EQ(lv.chunks.size(), (v.data.size() + chunk_size - 1) / chunk_size);
+    for (const LongValueChunk& c : lv.chunks) compressed += c.compressed;
+    Bytes got;
+    ASSERT_TRUE(lvs.ReadAll(lv, &got).ok()) << "id " << v.id;
+    EXPECT_TRUE(SameBytes(got, v.data)) << "id " << v.id;
+  }
+  EXPECT_EQ(compressed, m.compressed_chunks);
+
+  // An id the tree does not hold.
+  LongValue missing;
+  EXPECT_EQ(lvs.Read(m.long_value_root_page, forge::LongValueId(1, p.lv.id_size), &missing), -1);
+
+  // Through the records and the column decoder, as a table dump sees them.
+  const ColumnDecoder decoder(&lvs, table->long_value->root_page());
+  size_t row = 0;
+  EXPECT_EQ(reader->ForEachRecord(
+                *table,
+                [&](const RecordRef&, RecordColumns& columns) {
+                  DecodedColumn d = decoder.Decode(table->columns[1], columns.at(1));
+                  EXPECT_EQ(d.kind, DecodedColumn::Kind::kBinary) << d.text;
+                  EXPECT_TRUE(SameBytes(d.bytes, t.long_values[row].data)) << "row " << row;
+                  DecodedColumn note = decoder.Decode(table->columns[2], columns.at(2));
+                  EXPECT_EQ(note.text, "note " + std::to_string(row + 1));
+                  ++row;
+                  return true;
+                }),
+            1);
+  EXPECT_EQ(row, t.rows.size());
+}
+
+std::vector<LvParam> AllLvParams() {
+  std::vector<LvParam> out;
+  for (const Format& f : kFormats) {
+    for (const LvCase& c : kLvCases) out.push_back({f, c});
+  }
+  return out;
+}
+
+INSTANTIATE_TEST_SUITE_P(Layouts, LongValueTest, ::testing::ValuesIn(AllLvParams()),
+                         [](const ::testing::TestParamInfo<LvParam>& info) {
+                           return std::string(info.param.format.name) + "_" + info.param.lv.name;
+                         });
+
+// A long value whose tree lost one chunk: the reader says the value is
+// truncated and keeps the bytes before the gap, so a dump shows what is left.
+struct DropCase {
+  const char* name;
+  uint32_t dropped;  // chunk index
+  forge::Compression compression;
+};
+
+const DropCase kDropCases[] = {
+    {"first_chunk", 0, forge::Compression::kNone},
+    {"middle_chunk", 4, forge::Compression::kNone},
+    {"last_chunk", 9, forge::Compression::kNone},
+    {"middle_of_xpress_chunks", 4, forge::Compression::kXpress},
+};
+
+struct DropParam {
+  Format format;
+  DropCase drop;
+};
+void PrintTo(const DropParam& p, std::ostream* os) { *os << p.format.name << " " << p.drop.name; }
+
+class MissingChunkTest : public ::testing::TestWithParam<DropParam> {};
+
+TEST_P(MissingChunkTest, ValueIsTruncatedAtTheGap) {
+  const DropParam& p = GetParam();
+  constexpr uint32_t kChunk = 800;
+  constexpr uint32_t kChunks = 10;
+  LvCase c = {"", 3, kChunk * kChunks, kChunk, 4, p.drop.compression, 0, 0, false};
+  forge::DatabaseSpec spec = LongValueDatabase(p.format, c);
+  // Every value the same length, so every one has exactly kChunks chunks.
+  for (forge::LongValueSpec& v : spec.tables[0].long_values) v.data.resize(kChunk * kChunks);
+  const forge::LongValueSpec& damaged = spec.tables[0].long_values[1];
+  forge::DamageSpec damage;
+  damage.dropped_chunks.push_back({"Attachments", damaged.id, p.drop.dropped});
+  TempDatabase db(spec, damage);
+  EXPECT_EQ(db.manifest().tables[0].long_value_chunks, 3 * kChunks - 1);
+
+  auto reader = OpenWithCatalog(db.path());
+  ASSERT_TRUE(reader);
+  const TableDef* table = reader->FindTable("Attachments");
+  ASSERT_TRUE(table && table->long_value);
+  const LongValueReader lvs = reader->long_values();
+  const uint32_t root = table->long_value->root_page();
+
+  LongValue lv;
+  ASSERT_EQ(lvs.Read(root, forge::LongValueId(damaged.id), &lv), 0);
+  EXPECT_TRUE(lv.truncated);
+  EXPECT_EQ(lv.declared_size, kChunk * kChunks);
+  EXPECT_EQ(lv.total_size, uint64_t(kChunk) * p.drop.dropped);
+  Bytes got;
+  EXPECT_TRUE(lvs.ReadAll(lv, &got).ok());
+  EXPECT_TRUE(
+      SameBytes(got, Bytes(damaged.data.begin(), damaged.data.begin() + kChunk * p.drop.dropped)));
+
+  // The neighbours are whole.
+  for (size_t i : {0, 2}) {
+    const forge::LongValueSpec& v = spec.tables[0].long_values[i];
+    LongValue whole;
+    ASSERT_EQ(lvs.Read(root, forge::LongValueId(v.id), &whole), 0);
+    EXPECT_FALSE(whole.truncated);
+    Bytes bytes;
+    EXPECT_TRUE(lvs.ReadAll(whole, &bytes).ok());
+    EXPECT_TRUE(SameBytes(bytes, v.data));
+  }
+
+  // The decoder marks the column damaged and keeps what was assembled.
+  const ColumnDecoder decoder(&lvs, root);
+  size_t row = 0;
+  reader->ForEachRecord(*table, [&](const RecordRef&, RecordColumns& columns) {
+    DecodedColumn d = decoder.Decode(table->columns[1], columns.at(1));
+    if (row == 1) {
+      EXPECT_EQ(d.kind, DecodedColumn::Kind::kDamaged);
+      EXPECT_TRUE(SameBytes(d.bytes, got));
+    } else {
+      EXPECT_EQ(d.kind, DecodedColumn::Kind::kBinary);
+    }
+    ++row;
+    return true;
+  });
+  EXPECT_EQ(row, 3u);
+}
+
+std::vector<DropParam> AllDropParams() {
+  std::vector<DropParam> out;
+  for (const Format& f : kFormats) {
+    for (const DropCase& d : kDropCases) out.push_back({f, d});
+  }
+  return out;
+}
+
+INSTANTIATE_TEST_SUITE_P(Damage, MissingChunkTest, ::testing::ValuesIn(AllDropParams()),
+                         [](const ::testing::TestParamInfo<DropParam>& info) {
+                           return std::string(info.param.format.name) + "_" + info.param.drop.name;
+                         });
+
+}  // namespace
+}  // namespace tarnwell::engine
