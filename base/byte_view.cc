@@ -4,11 +4,10 @@ namespace tarnwell {
 
 std::string ToHex(ByteView bytes) {
   static const char kDigits[] = "0123456789abcdef";
-  std::string out;
-  out.reserve(bytes.size() * 2);
+  std::string out(bytes.size() * 2, '\0');
   for (size_t i = 0; i < bytes.size(); ++i) {
-    out.push_back(kDigits[bytes[i] >> 4]);
-    out.push_back(kDigits[bytes[i] & 0xF]);
+    out[2 * i] = kDigits[bytes[i] >> 4];
+    out[2 * i + 1] = kDigits[bytes[i] & 0xF];
   }
   return out;
 }

@@ -8,7 +8,12 @@ namespace tarnwell {
 std::string JsonEscape(std::string_view text) {
   std::string out;
   out.reserve(text.size() + 2);
-  for (unsigned char c : text) {
+  size_t run = 0;  // start of the stretch that needs no escaping
+  for (size_t i = 0; i < text.size(); ++i) {
+    const unsigned char c = static_cast<unsigned char>(text[i]);
+    if (c >= 0x20 && c != '"' && c != '\\') continue;
+    out.append(text.data() + run, i - run);
+    run = i + 1;
     switch (c) {
       case '"':
         out += "\\\"";
@@ -25,16 +30,14 @@ std::string JsonEscape(std::string_view text) {
       case '\t':
         out += "\\t";
         break;
-      default:
-        if (c < 0x20) {
-          char buf[8];
-          std::snprintf(buf, sizeof buf, "\\u%04x", c);
-          out += buf;
-        } else {
-          out.push_back(char(c));
-        }
+      default: {
+        char buf[8];
+        std::snprintf(buf, sizeof buf, "\\u%04x", c);
+        out += buf;
+      }
     }
   }
+  out.append(text.data() + run, text.size() - run);
   return out;
 }
 
@@ -84,7 +87,17 @@ JsonWriter& JsonWriter::Key(std::string_view key) {
 
 JsonWriter& JsonWriter::String(std::string_view value) {
   BeforeValue();
-  out_ += '"' + JsonEscape(value) + '"';
+  out_.push_back('"');
+  out_ += JsonEscape(value);
+  out_.push_back('"');
+  return *this;
+}
+
+JsonWriter& JsonWriter::PlainString(std::string_view value) {
+  BeforeValue();
+  out_.push_back('"');
+  out_.append(value.data(), value.size());
+  out_.push_back('"');
   return *this;
 }
 

@@ -18,6 +18,9 @@ class JsonWriter {
   JsonWriter& EndArray();
   JsonWriter& Key(std::string_view key);
   JsonWriter& String(std::string_view value);
+  // A string the caller knows needs no escaping (hexadecimal, plain ASCII
+  // names): written as is.
+  JsonWriter& PlainString(std::string_view value);
   JsonWriter& Int(int64_t value);
   JsonWriter& Uint(uint64_t value);
   JsonWriter& Double(double value);

@@ -34,7 +34,7 @@ void WriteJsonValue(JsonWriter& w, const engine::DecodedColumn& d) {
       w.String(d.text);
       break;
     case Kind::kBinary:
-      w.String(ToHex(ByteView(d.bytes)));
+      w.PlainString(ToHex(ByteView(d.bytes)));
       break;
     case Kind::kMulti:
       w.BeginArray();

@@ -28,7 +28,12 @@ std::string PathText(const std::vector<std::string>& path) {
   return out;
 }
 
-std::string KeyHex(uint64_t key) { return fmt::format("{:016x}", key); }
+// A message key as its 8 bytes stand in the database.
+std::string KeyHex(uint64_t key) {
+  uint8_t bytes[8];
+  StoreU64LE(bytes, key);
+  return ToHex(ByteView(bytes, sizeof bytes));
+}
 
 std::string TimeText(const store::FileTime& t) { return t ? DateText(*t) : ""; }
 
@@ -197,6 +202,7 @@ std::string FormatScanJson(StoreSession& session, const ScanOptions& options) {
 Status RunList(StoreSession& session, const std::string& ref, bool json, std::string* out) {
   const ShownFolder* folder = session.FindFolder(ref);
   if (!folder) return Status::NotFound("no folder with reference \"" + ref + "\"");
+  session.BeginJob();
   std::vector<store::MessageSummary> rows = session.store().ListFolder(folder->index);
   JsonWriter w;
   if (json) w.BeginArray();
@@ -235,6 +241,7 @@ Status RunShow(StoreSession& session, const std::string& ref, size_t item, bool 
                std::string* out) {
   const ShownFolder* folder = session.FindFolder(ref);
   if (!folder) return Status::NotFound("no folder with reference \"" + ref + "\"");
+  session.BeginJob();
   std::vector<store::MessageSummary> rows = session.store().ListFolder(folder->index);
   if (item == 0 || item > rows.size()) {
     return Status::NotFound(fmt::format("no item {} in a folder of {} items", item, rows.size()));

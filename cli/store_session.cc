@@ -130,9 +130,9 @@ Status StoreSession::Open(const ScanOptions& options, ProgressSink& progress) {
   constexpr uint64_t kSourceNumber = 1;
   s = app::OpenSource(settings_, kSourceNumber, progress, &source_);
   if (!s.ok()) return s;
-  RunningFlag running{true};
+  running_.store(true);
   SourceTree tree(&source_, &folders_, &top_text_);
-  outcome_ = app::RunScan(source_, kSourceNumber, running, progress, tree);
+  outcome_ = app::RunScan(source_, kSourceNumber, running_, progress, tree);
   if (!outcome_.tree_shown) {
     return Status::Corruption("no mailbox or public folder tree was found in " + options.db);
   }

@@ -46,6 +46,10 @@ class StoreSession {
   store::LegacyStore& store() { return *source_.store; }
   const app::SourceEntry& source() const { return source_; }
   const std::string& top_text() const { return top_text_; }
+  // A job after the scan (list, show) raises the running flag again: the
+  // scan's end sequence lowered it.
+  void BeginJob() { running_.store(true); }
+  RunningFlag& running() { return running_; }
 
  private:
   app::RunSettings settings_;
@@ -55,6 +59,7 @@ class StoreSession {
   std::string top_text_;
   std::string temp_root_;
   bool own_temp_ = false;
+  RunningFlag running_{false};
 };
 
 }  // namespace tarnwell::cli

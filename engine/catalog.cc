@@ -1,5 +1,8 @@
 #include "engine/catalog.h"
 
+#include <algorithm>
+#include <tuple>
+
 namespace tarnwell::engine {
 
 bool ParseCatalogRecord(ByteView data, CatalogEntry* entry, bool* extended) {
@@ -49,14 +52,28 @@ bool ParseCatalogRecord(ByteView data, CatalogEntry* entry, bool* extended) {
   return true;
 }
 
-void CatalogBuilder::Add(CatalogEntry entry) {
+std::vector<TableDef> CatalogBuilder::Finish() {
+  auto key = [](const CatalogEntry& e) { return std::make_tuple(e.table_object_id, e.type, e.id); };
+  std::stable_sort(entries_.begin(), entries_.end(),
+                   [&](const CatalogEntry& a, const CatalogEntry& b) { return key(a) < key(b); });
+  for (size_t i = 0; i < entries_.size(); ++i) {
+    if (i > 0 && key(entries_[i]) == key(entries_[i - 1])) continue;
+    File(std::move(entries_[i]));
+  }
+  entries_.clear();
+  return std::move(tables_);
+}
+
+void CatalogBuilder::File(CatalogEntry entry) {
   if (entry.type == kCatalogTable) {
     TableDef table;
     table.table = std::move(entry);
     tables_.push_back(std::move(table));
     return;
   }
-  if (tables_.empty()) return;  // objects before any table have no owner
+  // Objects belong to the table whose object id they carry; one whose table
+  // record is missing has no owner.
+  if (tables_.empty() || tables_.back().table.table_object_id != entry.table_object_id) return;
   TableDef& current = tables_.back();
   switch (entry.type) {
     case kCatalogColumn:

@@ -54,14 +54,19 @@ constexpr uint32_t kCatalogThirdColumn = 131;
 // `*extended` when the record's last fixed id is 12.
 bool ParseCatalogRecord(ByteView data, CatalogEntry* entry, bool* extended);
 
-// Files catalog entries, in catalog order, into tables.
+// Files catalog entries into tables. Entries are put in catalog key order
+// (table object id, type, id) before filing, so that records harvested page
+// by page in file order are filed as a tree walk would file them; an entry
+// whose key was met before (a stale copy on another page) is dropped.
 class CatalogBuilder {
  public:
-  void Add(CatalogEntry entry);
-  std::vector<TableDef> Finish() { return std::move(tables_); }
-  const std::vector<TableDef>& tables() const { return tables_; }
+  void Add(CatalogEntry entry) { entries_.push_back(std::move(entry)); }
+  std::vector<TableDef> Finish();
 
  private:
+  void File(CatalogEntry entry);
+
+  std::vector<CatalogEntry> entries_;
   std::vector<TableDef> tables_;
 };
 

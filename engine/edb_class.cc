@@ -171,13 +171,15 @@ int EdbClass::ParseCatalogRecords() {
   // References come grouped by page: keep the last page read.
   Page page;
   uint32_t page_number = 0;
-  bool page_ok = false;
+  bool page_read = false, page_ok = false;
   for (size_t k = 0; k < records_.size(); ++k) {
     if (k % kProgressEvery == 0) progress_->Position(int(k * kPermille / records_.size()));
     const RecordRef& ref = records_[k];
-    if (!page_ok || ref.page_number != page_number) {
+    if (ref.object_id != catalog_object) continue;
+    if (!page_read || ref.page_number != page_number) {
       page_number = ref.page_number;
-      page_ok = ReadPage(page_number, &page) && page.header().object_id == catalog_object;
+      page_read = true;
+      page_ok = ReadPage(page_number, &page);
     }
     if (!page_ok || ref.tag_index >= page.nodes().size()) continue;
     const NodeEntry& node = page.nodes()[ref.tag_index];

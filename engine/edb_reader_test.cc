@@ -285,24 +285,30 @@ TEST(LeafPageFilterTest, TakesOnlyLeavesOfDataTrees) {
 
 TEST(CatalogTest, FilesObjectsUnderTheirTableAndListsLegacyNames) {
   CatalogBuilder b;
-  auto entry = [](uint16_t type, uint32_t id, std::string name) {
+  auto entry = [](uint32_t table, uint16_t type, uint32_t id, std::string name) {
     CatalogEntry e;
+    e.table_object_id = table;
     e.type = type;
     e.id = id;
     e.column_type_or_root = id * 10;
     e.name = std::move(name);
     return e;
   };
-  b.Add(entry(kCatalogColumn, 1, "orphan"));  // before any table: dropped
-  b.Add(entry(kCatalogTable, 5, "1-23"));
-  b.Add(entry(kCatalogColumn, 1, "a"));
-  b.Add(entry(kCatalogLongValue, 7, "lv1"));
-  b.Add(entry(kCatalogLongValue, 8, "lv2"));
-  b.Add(entry(kCatalogIndex, 9, "ix"));
-  b.Add(entry(kCatalogTable, 6, "Mailbox"));
+  // Harvested in file order: not in key order, with a stale duplicate.
+  b.Add(entry(6, kCatalogTable, 6, "Mailbox"));
+  b.Add(entry(5, kCatalogLongValue, 8, "lv2"));
+  b.Add(entry(5, kCatalogColumn, 1, "a"));
+  b.Add(entry(1, kCatalogColumn, 1, "orphan"));  // owned by no table: dropped
+  b.Add(entry(5, kCatalogTable, 5, "1-23"));
+  b.Add(entry(5, kCatalogLongValue, 7, "lv1"));
+  b.Add(entry(5, kCatalogIndex, 9, "ix"));
+  b.Add(entry(5, kCatalogColumn, 1, "a-stale"));
   std::vector<TableDef> tables = b.Finish();
   ASSERT_EQ(tables.size(), 2u);
-  EXPECT_EQ(tables[0].columns.size(), 1u);
+  EXPECT_EQ(tables[0].name(), "1-23");
+  ASSERT_EQ(tables[0].columns.size(), 1u);
+  EXPECT_EQ(tables[0].columns[0].name, "a");
+  EXPECT_TRUE(tables[1].columns.empty());
   ASSERT_TRUE(tables[0].long_value);
   EXPECT_EQ(tables[0].long_value->name, "lv1");
   EXPECT_EQ(ListedTableName("1-23", PageFamily::kLegacy), "23");

@@ -23,6 +23,7 @@ void LeafHarvest::PushNodes(const Page& page, uint32_t page_number) {
     ref.page_number = page_number;
     ref.kind = LeafKind(page.flags());
     ref.file_position = RecordFilePosition(file_, page_number, nodes[tag].offset);
+    ref.object_id = page.header().object_id;
     records_->push_back(std::move(ref));
   }
 }
@@ -34,7 +35,6 @@ int LeafHarvest::CollectLeafPageRecords(const std::vector<LeafPageEntry>& list) 
     if (!running_.load()) break;
     if (i % kProgressEvery == 0) progress_.Position(int(i * kPermille / list.size()));
     const LeafPageEntry& entry = list[i];
-    if (entry.next == 0) continue;
     const int64_t number = file_.PageNumberAt(entry.file_position);
     if (number <= 0 || uint64_t(number) > file_.total_pages()) continue;
     if (!visited_.insert(uint32_t(number)).second) continue;

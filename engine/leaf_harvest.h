@@ -3,8 +3,10 @@
 // lands in the record vector, whether or not its tree is still reachable.
 //
 // Each page is harvested at most once (the visited-page set), whether it is
-// reached from its own list entry or along a chain. List entries without a
-// next page are skipped: such a page is reached only through a chain.
+// reached from its own list entry or along a chain. Pages without a next
+// page are harvested too: a tree whose data fits in one leaf (a small
+// catalog) has no chain to be reached through, and the last page of a chain
+// whose earlier pages are damaged would be lost.
 #ifndef TARNWELL_ENGINE_LEAF_HARVEST_H_
 #define TARNWELL_ENGINE_LEAF_HARVEST_H_
 

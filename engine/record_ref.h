@@ -43,6 +43,7 @@ struct RecordRef {
   uint16_t tag_index = 0;
   uint16_t data_offset = 0;  // of the data part, from the node start
   uint16_t data_size = 0;
+  uint32_t object_id = 0;    // the tree the page belongs to (page header)
   Bytes key;                 // prefix + suffix
 };
 

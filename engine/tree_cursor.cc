@@ -55,8 +55,8 @@ bool TreeCursor::Descend(uint32_t page_number, ByteView key, int depth) {
     // steps along the chain).
     const auto& nodes = page_.nodes();
     size_t last_ok = 0;
+    RecordRef ref;  // reused: keeps its key buffer
     for (size_t tag = 1; tag < nodes.size(); ++tag) {
-      RecordRef ref;
       if (DecodeNode(page_, uint16_t(tag), &ref) != NodeDecode::kOk) continue;
       last_ok = tag;
       if (CompareKeys(ByteView(ref.key), key) >= 0) return SettleFrom(tag);
@@ -65,8 +65,8 @@ bool TreeCursor::Descend(uint32_t page_number, ByteView key, int depth) {
     return SettleFrom(nodes.size());
   }
   const auto& nodes = page.nodes();
+  RecordRef ref;  // reused: keeps its key buffer
   for (size_t tag = 1; tag < nodes.size(); ++tag) {
-    RecordRef ref;
     NodeDecode d = DecodeNode(page, uint16_t(tag), &ref);
     if (d == NodeDecode::kDeleted) continue;
     if (d != NodeDecode::kOk) {

@@ -53,6 +53,7 @@ int TreeWalker::WalkPage(uint32_t page_number, int depth, const LeafVisitor& vis
         return 0;
     }
     ref.page_number = page_number;
+    ref.object_id = page.header().object_id;
     ref.file_position = RecordFilePosition(file_, page_number, nodes[tag].offset);
     if (leaf) {
       ref.kind = LeafKind(page.flags());

@@ -48,8 +48,8 @@ std::vector<ListMember> ParseDistributionList(ByteView value) {
 Bytes DistributionListText(const std::vector<ListMember>& members) {
   std::string text;
   for (const ListMember& m : members) {
-    text += "Name:" + m.display_name + "\tType:" + m.address_type + "\tEmailID:" +
-            m.email_address + "\r\n";
+    text += "Name:" + m.display_name + "\tType:" + m.address_type + "\tEmailID:" + m.email_address +
+            "\r\n";
   }
   Bytes out(std::begin(kByteOrderMark), std::end(kByteOrderMark));
   const Bytes body = Utf8ToUtf16LE(text);

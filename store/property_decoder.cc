@@ -14,8 +14,6 @@ namespace tarnwell::store {
 
 namespace {
 
-using engine::ColumnType;
-
 // The bytes before the two strings of "N67b6".
 constexpr size_t kN67b6LeadIn = 5;
 // Keys are the first 8 bytes of their column, least significant first.
@@ -65,7 +63,7 @@ struct Column {
   uint32_t engine_type;
   uint32_t code_page;
   ByteView value;
-  ByteOrder binary_time_order;   // for 8-byte binary times
+  ByteOrder binary_time_order;    // for 8-byte binary times
   std::optional<uint64_t> typed;  // a binary value already read by its name
   const PropertyBlobParser* blob_parser;
 };
@@ -75,11 +73,11 @@ using Handler = int (*)(const Column&, ItemRecords*);
 }  // namespace
 
 struct PropertyDecoder::Rule {
-  std::vector<std::string_view> names;   // empty: `matches` decides
-  bool (*matches)(const Column&) = nullptr;
+  std::vector<std::string_view> names;  // empty: `matches` decides
   uint32_t purposes;
   uint32_t versions;
   Handler handler;
+  bool (*matches)(const Column&) = nullptr;
 };
 
 namespace {
@@ -99,22 +97,46 @@ int AsInteger(C c, int64_t* out) {
   bool is_signed = false;
   switch (c.engine_type) {
     case engine::kColumnBit:
-    case engine::kColumnUnsignedByte: width = 1; break;
-    case engine::kColumnShort: width = 2; is_signed = true; break;
-    case engine::kColumnUnsignedShort: width = 2; break;
-    case engine::kColumnLong: width = 4; is_signed = true; break;
-    case engine::kColumnUnsignedLong: width = 4; break;
+    case engine::kColumnUnsignedByte:
+      width = 1;
+      break;
+    case engine::kColumnShort:
+      width = 2;
+      is_signed = true;
+      break;
+    case engine::kColumnUnsignedShort:
+      width = 2;
+      break;
+    case engine::kColumnLong:
+      width = 4;
+      is_signed = true;
+      break;
+    case engine::kColumnUnsignedLong:
+      width = 4;
+      break;
     case engine::kColumnCurrency:
-    case engine::kColumnLongLong: width = 8; is_signed = true; break;
-    default: return 0;
+    case engine::kColumnLongLong:
+      width = 8;
+      is_signed = true;
+      break;
+    default:
+      return 0;
   }
   if (c.value.size() < width) return -1;
   const uint8_t* p = c.value.data();
   switch (width) {
-    case 1: *out = p[0]; break;
-    case 2: *out = is_signed ? int64_t(int16_t(LoadU16LE(p))) : int64_t(LoadU16LE(p)); break;
-    case 4: *out = is_signed ? int64_t(int32_t(LoadU32LE(p))) : int64_t(LoadU32LE(p)); break;
-    default: *out = static_cast<int64_t>(LoadU64LE(p)); break;
+    case 1:
+      *out = p[0];
+      break;
+    case 2:
+      *out = is_signed ? int64_t(int16_t(LoadU16LE(p))) : int64_t(LoadU16LE(p));
+      break;
+    case 4:
+      *out = is_signed ? int64_t(int32_t(LoadU32LE(p))) : int64_t(LoadU32LE(p));
+      break;
+    default:
+      *out = static_cast<int64_t>(LoadU64LE(p));
+      break;
   }
   return 1;
 }
@@ -241,26 +263,38 @@ int SetKey(C c, uint64_t* field) {
 // Fields every item detail record has, chosen by the purpose.
 uint8_t* ResponseRequested(C c, R r) {
   switch (c.purpose) {
-    case DecodePurpose::kMessageDetail: return &r->message.response_requested;
-    case DecodePurpose::kContactDetail: return &r->contact.response_requested;
-    case DecodePurpose::kAppointmentDetail: return &r->appointment.response_requested;
-    default: return &r->task.response_requested;
+    case DecodePurpose::kMessageDetail:
+      return &r->message.response_requested;
+    case DecodePurpose::kContactDetail:
+      return &r->contact.response_requested;
+    case DecodePurpose::kAppointmentDetail:
+      return &r->appointment.response_requested;
+    default:
+      return &r->task.response_requested;
   }
 }
 uint8_t* ReassignmentProhibited(C c, R r) {
   switch (c.purpose) {
-    case DecodePurpose::kMessageDetail: return &r->message.reassignment_prohibited;
-    case DecodePurpose::kContactDetail: return &r->contact.reassignment_prohibited;
-    case DecodePurpose::kAppointmentDetail: return &r->appointment.reassignment_prohibited;
-    default: return &r->task.reassignment_prohibited;
+    case DecodePurpose::kMessageDetail:
+      return &r->message.reassignment_prohibited;
+    case DecodePurpose::kContactDetail:
+      return &r->contact.reassignment_prohibited;
+    case DecodePurpose::kAppointmentDetail:
+      return &r->appointment.reassignment_prohibited;
+    default:
+      return &r->task.reassignment_prohibited;
   }
 }
 Bytes* ConversationIndex(C c, R r) {
   switch (c.purpose) {
-    case DecodePurpose::kMessageDetail: return &r->message.conversation_index;
-    case DecodePurpose::kContactDetail: return &r->contact.conversation_index;
-    case DecodePurpose::kAppointmentDetail: return &r->appointment.conversation_index;
-    default: return &r->task.conversation_index;
+    case DecodePurpose::kMessageDetail:
+      return &r->message.conversation_index;
+    case DecodePurpose::kContactDetail:
+      return &r->contact.conversation_index;
+    case DecodePurpose::kAppointmentDetail:
+      return &r->appointment.conversation_index;
+    default:
+      return &r->task.conversation_index;
   }
 }
 
@@ -393,236 +427,228 @@ bool IsAnyText(C c) { return IsText(c.engine_type); }
 // so their rule set is this table without the rules that exclude them.
 
 const std::vector<PropertyDecoder::Rule>& Rules() {
+  // clang-format off
   static const std::vector<PropertyDecoder::Rule> rules = {
-      // Mailbox and folder rows: the nodes of the folder tree.
-      {{"Q6764"}, nullptr, kMailbox, kAllVersions,
-       [](C c, R r) { return SetInteger(c, &r->node.folder_id); }},
-      {{"MailboxNumber"}, nullptr, kMailbox, Version(kStoreExchange2013),
-       [](C c, R r) { return SetInteger(c, &r->node.folder_id); }},
-      {{}, IsAnyText, kMailbox, kAllVersions,
-       [](C c, R r) { return SetText(c, &r->node.display_name); }},
-      {{"Q6748"}, nullptr, kFolder, kAllVersions,
-       [](C c, R r) { return SetInteger(c, &r->node.folder_id); }},
-      {{"Q6749"}, nullptr, kFolder, kAllVersions,
-       [](C c, R r) { return SetInteger(c, &r->node.parent_id); }},
-      {{"S3001", "DisplayName"}, nullptr, kFolder, kAllVersions,
-       [](C c, R r) { return SetText(c, &r->node.display_name); }},
-      {{"S3613", "ContainerClass"}, nullptr, kFolder, kAllVersions,
-       [](C c, R r) { return SetText(c, &r->node.container_class); }},
+    // Mailbox and folder rows: the nodes of the folder tree.
+    {{"Q6764"}, kMailbox, kAllVersions,
+     [](C c, R r) { return SetInteger(c, &r->node.folder_id); }},
+    {{"MailboxNumber"}, kMailbox, Version(kStoreExchange2013),
+     [](C c, R r) { return SetInteger(c, &r->node.folder_id); }},
+    {{}, kMailbox, kAllVersions,
+     [](C c, R r) { return SetText(c, &r->node.display_name); }, IsAnyText},
+    {{"Q6748"}, kFolder, kAllVersions,
+     [](C c, R r) { return SetInteger(c, &r->node.folder_id); }},
+    {{"Q6749"}, kFolder, kAllVersions,
+     [](C c, R r) { return SetInteger(c, &r->node.parent_id); }},
+    {{"S3001", "DisplayName"}, kFolder, kAllVersions,
+     [](C c, R r) { return SetText(c, &r->node.display_name); }},
+    {{"S3613", "ContainerClass"}, kFolder, kAllVersions,
+     [](C c, R r) { return SetText(c, &r->node.container_class); }},
 
-      // Keys, whatever the purpose.
-      {{"N67b0"}, nullptr, kAnyPurpose, kAllVersions,
-       [](C c, R r) { return SetKey(c, &r->summary.message_key); }},
-      {{"Q3f88", "Q674a"}, nullptr, kAnyPurpose, kAllVersions,
-       [](C c, R r) { return SetKey(c, &r->attachment.key); }},
-      {{"BodyType"}, nullptr, kAnyPurpose, kAllVersions,
-       [](C c, R r) { return SetInteger(c, &r->message.body_type); }},
+    // Keys, whatever the purpose.
+    {{"N67b0"}, kAnyPurpose, kAllVersions,
+     [](C c, R r) { return SetKey(c, &r->summary.message_key); }},
+    {{"Q3f88", "Q674a"}, kAnyPurpose, kAllVersions,
+     [](C c, R r) { return SetKey(c, &r->attachment.key); }},
+    {{"BodyType"}, kAnyPurpose, kAllVersions,
+     [](C c, R r) { return SetInteger(c, &r->message.body_type); }},
 
-      // Message-list rows.
-      {{"IsRead"}, nullptr, kList, kAllVersions, SetReadText},
-      {{"Le07"}, nullptr, kList, kAllVersions, SetFlagsText},
-      {{"HasAttachments", "Be1b"}, nullptr, kList, kAllVersions,
-       [](C c, R r) { return SetBoolean(c, &r->summary.has_attachments); }},
-      {{"Importance", "L17"}, nullptr, kList, kAllVersions,
-       [](C c, R r) { return SetInteger(c, &r->summary.importance); }},
-      {{"T3007", "DateCreated"}, nullptr, kList, kAllVersions,
-       [](C c, R r) { return SetDateText(c, &r->summary.created); }},
-      {{"T3008", "LastModificationTime"}, nullptr, kList, kAllVersions,
-       [](C c, R r) { return SetDateText(c, &r->summary.modified); }},
-      {{"Te06", "DateReceived"}, nullptr, kList, kAllVersions,
-       [](C c, R r) { return SetDateText(c, &r->summary.received); }},
-      {{"Se04", "S678e", "DisplayTo"}, nullptr, kList, kNotExchange55,
-       [](C c, R r) { return SetText(c, &r->summary.to); }},
-      {{"S42"}, nullptr, kList, kNotExchange55,
-       [](C c, R r) { return SetText(c, &r->summary.sender); }},
-      {{"S3d", "SubjectPrefix"}, nullptr, kList, kAllVersions, PrependSubject},
-      {{"Se1d"}, nullptr, kList, kAllVersions, AppendSubject},
-      {{"S1a", "MessageClass"}, nullptr, kList, kAllVersions,
-       [](C c, R r) { return SetText(c, &r->summary.message_class); }},
+    // Message-list rows.
+    {{"IsRead"}, kList, kAllVersions, SetReadText},
+    {{"Le07"}, kList, kAllVersions, SetFlagsText},
+    {{"HasAttachments", "Be1b"}, kList, kAllVersions,
+     [](C c, R r) { return SetBoolean(c, &r->summary.has_attachments); }},
+    {{"Importance", "L17"}, kList, kAllVersions,
+     [](C c, R r) { return SetInteger(c, &r->summary.importance); }},
+    {{"T3007", "DateCreated"}, kList, kAllVersions,
+     [](C c, R r) { return SetDateText(c, &r->summary.created); }},
+    {{"T3008", "LastModificationTime"}, kList, kAllVersions,
+     [](C c, R r) { return SetDateText(c, &r->summary.modified); }},
+    {{"Te06", "DateReceived"}, kList, kAllVersions,
+     [](C c, R r) { return SetDateText(c, &r->summary.received); }},
+    {{"Se04", "S678e", "DisplayTo"}, kList, kNotExchange55,
+     [](C c, R r) { return SetText(c, &r->summary.to); }},
+    {{"S42"}, kList, kNotExchange55,
+     [](C c, R r) { return SetText(c, &r->summary.sender); }},
+    {{"S3d", "SubjectPrefix"}, kList, kAllVersions, PrependSubject},
+    {{"Se1d"}, kList, kAllVersions, AppendSubject},
+    {{"S1a", "MessageClass"}, kList, kAllVersions,
+     [](C c, R r) { return SetText(c, &r->summary.message_class); }},
 
-      // Fields every item detail record has.
-      {{"B63"}, nullptr, kItemDetail, kAllVersions,
-       [](C c, R r) { return SetBoolean(c, ResponseRequested(c, r)); }},
-      {{"B2b"}, nullptr, kItemDetail, kAllVersions,
-       [](C c, R r) { return SetBoolean(c, ReassignmentProhibited(c, r)); }},
-      {{"ConversationIndex", "N71"}, nullptr, kItemDetail, kAllVersions,
-       [](C c, R r) { return SetBytes(c, ConversationIndex(c, r)); }},
-      {{"PropertyBlob", "OffPagePropertyBlob"}, nullptr, kItemDetail, kAllVersions, ParseBlob},
-      {{"PropertyBlob", "OffPagePropertyBlob"}, nullptr, kList, Version(kStoreExchange2013),
-       ParseBlob},
+    // Fields every item detail record has.
+    {{"B63"}, kItemDetail, kAllVersions,
+     [](C c, R r) { return SetBoolean(c, ResponseRequested(c, r)); }},
+    {{"B2b"}, kItemDetail, kAllVersions,
+     [](C c, R r) { return SetBoolean(c, ReassignmentProhibited(c, r)); }},
+    {{"ConversationIndex", "N71"}, kItemDetail, kAllVersions,
+     [](C c, R r) { return SetBytes(c, ConversationIndex(c, r)); }},
+    {{"PropertyBlob", "OffPagePropertyBlob"}, kItemDetail, kAllVersions, ParseBlob},
+    {{"PropertyBlob", "OffPagePropertyBlob"}, kList, Version(kStoreExchange2013), ParseBlob},
 
-      // Message detail.
-      {{"NativeBody", "N1013"}, nullptr, kMessage, kAllVersions, SetNativeBody},
-      {{"S1000"}, nullptr, kMessage, kAllVersions, SetTextBody},
-      {{"N1009"}, nullptr, kMessage, kAllVersions, SetRtfBody},
-      {{"F6659"}, nullptr, kMessage, kAllVersions,
-       [](C c, R r) { return SetBytes(c, &r->message.stream_page_list); }},
-      {{"N67b4"}, nullptr, kMessage, kAllVersions,
-       [](C c, R r) { return SetBytes(c, &r->message.further_binary_1); }},
-      {{"N67b3"}, nullptr, kMessage, kAllVersions,
-       [](C c, R r) { return SetBytes(c, &r->message.further_binary_2); }},
-      {{"N67b6"}, nullptr, kMessage, kAllVersions, SetN67b6},
-      {{"N3fca"}, nullptr, kMessage, kAllVersions, SetN3fca},
-      {{"MN81a9"}, nullptr, kMessage, kAllVersions, SetMembers},
-      {{"MN8165"}, nullptr, kMessage, Version(kStoreExchange2010), SetMembers},
-      {{"T3007", "T8100", "DateCreated"}, nullptr, kMessage, kAllVersions,
-       [](C c, R r) { return SetTimeIfUnset(c, &r->message.creation_time); }},
-      {{"T811f", "T807a"}, nullptr, kMessage, kAllVersions,
-       [](C c, R r) { return SetTime(c, &r->message.named_time_1); }},
-      {{"T82cc"}, nullptr, kMessage, kAllVersions,
-       [](C c, R r) { return SetTime(c, &r->message.named_time_2); }},
-      {{"T82e7"}, nullptr, kMessage, kAllVersions,
-       [](C c, R r) { return SetTime(c, &r->message.named_time_3); }},
-      {{"L82e6"}, nullptr, kMessage, kAllVersions,
-       [](C c, R r) { return SetInteger(c, &r->message.named_value); }},
-      {{"L36"}, nullptr, kMessage, kAllVersions,
-       [](C c, R r) { return SetInteger(c, &r->message.sensitivity); }},
-      {{"L3fde"}, nullptr, kMessage, kAllVersions,
-       [](C c, R r) { return SetInteger(c, &r->message.internet_code_page); }},
-      {{"L80df", kThrough, "L80e3", "L82e1", kThrough, "L82e5", "L8128", "L8129", "L8120"},
-       nullptr, kMessage, kAllVersions, SetNamedValue},
-      {{"B2"}, nullptr, kMessage, kAllVersions,
-       [](C c, R r) { return SetTriState(c, &r->message.b2); }},
-      {{"B23"}, nullptr, kMessage, kAllVersions,
-       [](C c, R r) { return SetBoolean(c, &r->message.b23); }},
-      {{"B29"}, nullptr, kMessage, kAllVersions,
-       [](C c, R r) { return SetBoolean(c, &r->message.b29); }},
-      {{"B3016"}, nullptr, kMessage, kAllVersions,
-       [](C c, R r) { return SetBoolean(c, &r->message.b3016); }},
-      {{"S7d"}, nullptr, kMessage, kAllVersions,
-       [](C c, R r) { return SetText(c, &r->message.transport_headers); }},
-      {{"S1042"}, nullptr, kMessage, kAllVersions,
-       [](C c, R r) { return SetText(c, &r->message.in_reply_to); }},
-      {{"S50"}, nullptr, kMessage, kAllVersions,
-       [](C c, R r) { return SetText(c, &r->message.reply_recipient_names); }},
-      {{"S1046"}, nullptr, kMessage, kAllVersions,
-       [](C c, R r) { return SetText(c, &r->message.s1046); }},
-      {{"S8203"}, nullptr, kMessage, kAllVersions,
-       [](C c, R r) { return SetText(c, &r->message.named_string); }},
-      {{"MS813a"}, nullptr, kMessage, kAllVersions,
-       [](C c, R r) { return SetText(c, &r->message.named_multi_string); }},
-      {{"MS8003", "MS80db", "S8027", "S70", "S82e9", "S82e8"}, nullptr, kMessage, kAllVersions,
-       [](C c, R r) { return SetListed(c, &r->message.strings); }},
+    // Message detail.
+    {{"NativeBody", "N1013"}, kMessage, kAllVersions, SetNativeBody},
+    {{"S1000"}, kMessage, kAllVersions, SetTextBody},
+    {{"N1009"}, kMessage, kAllVersions, SetRtfBody},
+    {{"F6659"}, kMessage, kAllVersions,
+     [](C c, R r) { return SetBytes(c, &r->message.stream_page_list); }},
+    {{"N67b4"}, kMessage, kAllVersions,
+     [](C c, R r) { return SetBytes(c, &r->message.further_binary_1); }},
+    {{"N67b3"}, kMessage, kAllVersions,
+     [](C c, R r) { return SetBytes(c, &r->message.further_binary_2); }},
+    {{"N67b6"}, kMessage, kAllVersions, SetN67b6},
+    {{"N3fca"}, kMessage, kAllVersions, SetN3fca},
+    {{"MN81a9"}, kMessage, kAllVersions, SetMembers},
+    {{"MN8165"}, kMessage, Version(kStoreExchange2010), SetMembers},
+    {{"T3007", "T8100", "DateCreated"}, kMessage, kAllVersions,
+     [](C c, R r) { return SetTimeIfUnset(c, &r->message.creation_time); }},
+    {{"T811f", "T807a"}, kMessage, kAllVersions,
+     [](C c, R r) { return SetTime(c, &r->message.named_time_1); }},
+    {{"T82cc"}, kMessage, kAllVersions,
+     [](C c, R r) { return SetTime(c, &r->message.named_time_2); }},
+    {{"T82e7"}, kMessage, kAllVersions,
+     [](C c, R r) { return SetTime(c, &r->message.named_time_3); }},
+    {{"L82e6"}, kMessage, kAllVersions,
+     [](C c, R r) { return SetInteger(c, &r->message.named_value); }},
+    {{"L36"}, kMessage, kAllVersions,
+     [](C c, R r) { return SetInteger(c, &r->message.sensitivity); }},
+    {{"L3fde"}, kMessage, kAllVersions,
+     [](C c, R r) { return SetInteger(c, &r->message.internet_code_page); }},
+    {{"L80df", kThrough, "L80e3", "L82e1", kThrough, "L82e5", "L8128", "L8129", "L8120"},
+     kMessage, kAllVersions, SetNamedValue},
+    {{"B2"}, kMessage, kAllVersions,
+     [](C c, R r) { return SetTriState(c, &r->message.b2); }},
+    {{"B23"}, kMessage, kAllVersions,
+     [](C c, R r) { return SetBoolean(c, &r->message.b23); }},
+    {{"B29"}, kMessage, kAllVersions,
+     [](C c, R r) { return SetBoolean(c, &r->message.b29); }},
+    {{"B3016"}, kMessage, kAllVersions,
+     [](C c, R r) { return SetBoolean(c, &r->message.b3016); }},
+    {{"S7d"}, kMessage, kAllVersions,
+     [](C c, R r) { return SetText(c, &r->message.transport_headers); }},
+    {{"S1042"}, kMessage, kAllVersions,
+     [](C c, R r) { return SetText(c, &r->message.in_reply_to); }},
+    {{"S50"}, kMessage, kAllVersions,
+     [](C c, R r) { return SetText(c, &r->message.reply_recipient_names); }},
+    {{"S1046"}, kMessage, kAllVersions,
+     [](C c, R r) { return SetText(c, &r->message.s1046); }},
+    {{"S8203"}, kMessage, kAllVersions,
+     [](C c, R r) { return SetText(c, &r->message.named_string); }},
+    {{"MS813a"}, kMessage, kAllVersions,
+     [](C c, R r) { return SetText(c, &r->message.named_multi_string); }},
+    {{"MS8003", "MS80db", "S8027", "S70", "S82e9", "S82e8"}, kMessage, kAllVersions,
+     [](C c, R r) { return SetListed(c, &r->message.strings); }},
 
-      // Contact detail.
-      {{"T3a42", "T8159"}, nullptr, kContact, kAllVersions,
-       [](C c, R r) { return SetTime(c, &r->contact.birthday); }},
-      {{"T3a41", "T815a"}, nullptr, kContact, kAllVersions,
-       [](C c, R r) { return SetTime(c, &r->contact.anniversary); }},
-      {{"I3a4d"}, nullptr, kContact, kAllVersions,
-       [](C c, R r) { return SetInteger(c, &r->contact.gender); }},
-      {{"L8098"}, nullptr, kContact, kAllVersions,
-       [](C c, R r) { return SetInteger(c, &r->contact.contact_value); }},
-      {{"S808b"}, nullptr, kContact, kAllVersions,
-       [](C c, R r) { return SetTextAndListed(c, &r->contact.s808b, &r->contact.strings); }},
-      {{"S3a02", "S3a05", "S3a06", "S3a08", "S3a09", "S3a0a", "S3a11", "S3a16", kThrough, "S3a1f",
-        "S3a21", "S3a23", kThrough, "S3a25", "S3a2c", kThrough, "S3a30", "S3a43", kThrough,
-        "S3a48", "S3a4b", "S3a4e", "S3a4f", "S3a57", "MS3a58", "S3a59", kThrough, "S3a5d",
-        "S3a5f", kThrough, "S3a63", "S8008", "S8009", "S800a", "S800e", "S800f", "S8010",
-        "S801a", kThrough, "S801e", "S808d", "S8095", "S8097", "S809c", "S809e", "S80a5",
-        "S80a6", "S80a7", "S8106", "S8110", kThrough, "S8114", "S811c", kThrough, "S811f",
-        "S813c", kThrough, "S813f", "S8158", "S81af", "S81b0", "S81b4", "S81b5", "S81b9",
-        "S81ba", "S8263", "S8273"},
-       nullptr, kContact, kAllVersions, [](C c, R r) { return SetListed(c, &r->contact.strings); }},
+    // Contact detail.
+    {{"T3a42", "T8159"}, kContact, kAllVersions,
+     [](C c, R r) { return SetTime(c, &r->contact.birthday); }},
+    {{"T3a41", "T815a"}, kContact, kAllVersions,
+     [](C c, R r) { return SetTime(c, &r->contact.anniversary); }},
+    {{"I3a4d"}, kContact, kAllVersions,
+     [](C c, R r) { return SetInteger(c, &r->contact.gender); }},
+    {{"L8098"}, kContact, kAllVersions,
+     [](C c, R r) { return SetInteger(c, &r->contact.contact_value); }},
+    {{"S808b"}, kContact, kAllVersions,
+     [](C c, R r) { return SetTextAndListed(c, &r->contact.s808b, &r->contact.strings); }},
+    {{"S3a02", "S3a05", "S3a06", "S3a08", "S3a09", "S3a0a", "S3a11", "S3a16", kThrough, "S3a1f",
+      "S3a21", "S3a23", kThrough, "S3a25", "S3a2c", kThrough, "S3a30", "S3a43", kThrough, "S3a48",
+      "S3a4b", "S3a4e", "S3a4f", "S3a57", "MS3a58", "S3a59", kThrough, "S3a5d", "S3a5f", kThrough,
+      "S3a63", "S8008", "S8009", "S800a", "S800e", "S800f", "S8010", "S801a", kThrough, "S801e",
+      "S808d", "S8095", "S8097", "S809c", "S809e", "S80a5", "S80a6", "S80a7", "S8106", "S8110",
+      kThrough, "S8114", "S811c", kThrough, "S811f", "S813c", kThrough, "S813f", "S8158", "S81af",
+      "S81b0", "S81b4", "S81b5", "S81b9", "S81ba", "S8263", "S8273"}, kContact, kAllVersions,
+     [](C c, R r) { return SetListed(c, &r->contact.strings); }},
 
-      // Appointment detail. The body text is kept once, outside the list.
-      {{"T8198", "T810b", "T814d", "T61", "T8196"}, nullptr, kAppointment, kAllVersions,
-       [](C c, R r) { return SetTime(c, &r->appointment.end_time); }},
-      {{"T8100", "T39", "DateCreated"}, nullptr, kAppointment, kAllVersions,
-       [](C c, R r) { return SetTime(c, &r->appointment.creation_time); }},
-      {{"T814e", "T8197", "T60", "T81ef"}, nullptr, kAppointment, kAllVersions,
-       [](C c, R r) { return SetTime(c, &r->appointment.start_time); }},
-      {{"T8033"}, nullptr, kAppointment, kAllVersions,
-       [](C c, R r) { return SetTime(c, &r->appointment.named_time); }},
-      {{"T8102"}, nullptr, kAppointment, kAllVersions,
-       [](C c, R r) { return SetTime(c, &r->appointment.named_time_2); }},
-      {{"L805c"}, nullptr, kAppointment, kAllVersions, SetAppointmentValue},
-      {{"L81ff"}, nullptr, kAppointment, Version(kStoreExchange2007), SetAppointmentValue},
-      {{"L81e9"}, nullptr, kAppointment, Version(kStoreExchange2000), SetAppointmentValue},
-      {{"B828c"}, nullptr, kAppointment, kAllVersions,
-       [](C c, R r) { return SetBoolean(c, &r->appointment.flag); }},
-      {{"B2"}, nullptr, kAppointment, kAllVersions,
-       [](C c, R r) { return SetTriState(c, &r->appointment.b2); }},
-      {{"L36", "Sensitivity"}, nullptr, kAppointment, kAllVersions,
-       [](C c, R r) { return SetInteger(c, &r->appointment.sensitivity); }},
-      {{"S1000"}, nullptr, kAppointment, kAllVersions,
-       [](C c, R r) { return SetText(c, &r->appointment.body_text); }},
-      {{"S810c"}, nullptr, kAppointment, kAllVersions,
-       [](C c, R r) {
-         return SetTextAndListed(c, &r->appointment.s810c, &r->appointment.strings);
-       }},
-      {{"S8051", "S8201"}, nullptr, kAppointment, kAllVersions,
-       [](C c, R r) {
-         return SetTextAndListed(c, &r->appointment.s8051_or_s8201, &r->appointment.strings);
-       }},
-      {{"S80fd"}, nullptr, kAppointment, kAllVersions,
-       [](C c, R r) {
-         return SetTextAndListed(c, &r->appointment.s80fd, &r->appointment.strings);
-       }},
-      {{"S8068"}, nullptr, kAppointment, kAllVersions,
-       [](C c, R r) {
-         return SetTextAndListed(c, &r->appointment.s8068, &r->appointment.strings);
-       }},
-      {{"S8186"}, nullptr, kAppointment, kAllVersions,
-       [](C c, R r) {
-         return SetTextAndListed(c, &r->appointment.s8186, &r->appointment.strings);
-       }},
-      {{"S8004", "S8009", "S8042", "S8058", "S806b", "S81e6", "S81fc"}, nullptr, kAppointment,
-       kAllVersions, [](C c, R r) { return SetListed(c, &r->appointment.strings); }},
+    // Appointment detail. The body text is kept once, outside the list.
+    {{"T8198", "T810b", "T814d", "T61", "T8196"}, kAppointment, kAllVersions,
+     [](C c, R r) { return SetTime(c, &r->appointment.end_time); }},
+    {{"T8100", "T39", "DateCreated"}, kAppointment, kAllVersions,
+     [](C c, R r) { return SetTime(c, &r->appointment.creation_time); }},
+    {{"T814e", "T8197", "T60", "T81ef"}, kAppointment, kAllVersions,
+     [](C c, R r) { return SetTime(c, &r->appointment.start_time); }},
+    {{"T8033"}, kAppointment, kAllVersions,
+     [](C c, R r) { return SetTime(c, &r->appointment.named_time); }},
+    {{"T8102"}, kAppointment, kAllVersions,
+     [](C c, R r) { return SetTime(c, &r->appointment.named_time_2); }},
+    {{"L805c"}, kAppointment, kAllVersions, SetAppointmentValue},
+    {{"L81ff"}, kAppointment, Version(kStoreExchange2007), SetAppointmentValue},
+    {{"L81e9"}, kAppointment, Version(kStoreExchange2000), SetAppointmentValue},
+    {{"B828c"}, kAppointment, kAllVersions,
+     [](C c, R r) { return SetBoolean(c, &r->appointment.flag); }},
+    {{"B2"}, kAppointment, kAllVersions,
+     [](C c, R r) { return SetTriState(c, &r->appointment.b2); }},
+    {{"L36", "Sensitivity"}, kAppointment, kAllVersions,
+     [](C c, R r) { return SetInteger(c, &r->appointment.sensitivity); }},
+    {{"S1000"}, kAppointment, kAllVersions,
+     [](C c, R r) { return SetText(c, &r->appointment.body_text); }},
+    {{"S810c"}, kAppointment, kAllVersions,
+     [](C c, R r) { return SetTextAndListed(c, &r->appointment.s810c, &r->appointment.strings); }},
+    {{"S8051", "S8201"}, kAppointment, kAllVersions,
+     [](C c, R r) {
+       return SetTextAndListed(c, &r->appointment.s8051_or_s8201, &r->appointment.strings);
+     }},
+    {{"S80fd"}, kAppointment, kAllVersions,
+     [](C c, R r) { return SetTextAndListed(c, &r->appointment.s80fd, &r->appointment.strings); }},
+    {{"S8068"}, kAppointment, kAllVersions,
+     [](C c, R r) { return SetTextAndListed(c, &r->appointment.s8068, &r->appointment.strings); }},
+    {{"S8186"}, kAppointment, kAllVersions,
+     [](C c, R r) { return SetTextAndListed(c, &r->appointment.s8186, &r->appointment.strings); }},
+    {{"S8004", "S8009", "S8042", "S8058", "S806b", "S81e6", "S81fc"}, kAppointment, kAllVersions,
+     [](C c, R r) { return SetListed(c, &r->appointment.strings); }},
 
-      // Task detail. The body text is kept once, outside the list.
-      {{"T8078", "T81ef"}, nullptr, kTask, kAllVersions,
-       [](C c, R r) { return SetTime(c, &r->task.times[0]); }},
-      {{"T811e", "T8079"}, nullptr, kTask, kAllVersions,
-       [](C c, R r) { return SetTime(c, &r->task.times[1]); }},
-      {{"T811f", "T807a"}, nullptr, kTask, kAllVersions,
-       [](C c, R r) { return SetTime(c, &r->task.times[2]); }},
-      {{"Tf"}, nullptr, kTask, kAllVersions,
-       [](C c, R r) { return SetTime(c, &r->task.times[3]); }},
-      {{"T3fef"}, nullptr, kTask, kAllVersions,
-       [](C c, R r) { return SetTime(c, &r->task.times[4]); }},
-      {{"T8125", "T807e"}, nullptr, kTask, kAllVersions,
-       [](C c, R r) { return SetTime(c, &r->task.time_6); }},
-      {{"T39"}, nullptr, kTask, kAllVersions,
-       [](C c, R r) { return SetTime(c, &r->task.time_7); }},
-      {{"B8124"}, nullptr, kTask, kAllVersions,
-       [](C c, R r) { return SetBoolean(c, &r->task.flag); }},
-      {{"D8121"}, nullptr, kTask, kAllVersions,
-       [](C c, R r) { return AsDouble(c, &r->task.percent_complete); }},
-      {{"L8138"}, nullptr, kTask, kAllVersions,
-       [](C c, R r) { return SetInteger(c, &r->task.value); }},
-      {{"L36", "Sensitivity"}, nullptr, kTask, kAllVersions,
-       [](C c, R r) { return SetInteger(c, &r->task.sensitivity); }},
-      {{"L26", "Priority"}, nullptr, kTask, kAllVersions,
-       [](C c, R r) { return SetInteger(c, &r->task.priority); }},
-      {{"L3fde"}, nullptr, kTask, kAllVersions,
-       [](C c, R r) { return SetInteger(c, &r->task.internet_code_page); }},
-      {{"S1000"}, nullptr, kTask, kAllVersions,
-       [](C c, R r) { return SetText(c, &r->task.body_text); }},
-      {{"S814a"}, nullptr, kTask, kAllVersions,
-       [](C c, R r) { return SetTextAndListed(c, &r->task.s814a, &r->task.strings); }},
-      {{"MS813a"}, nullptr, kTask, kAllVersions,
-       [](C c, R r) { return SetTextAndListed(c, &r->task.ms813a, &r->task.strings); }},
-      {{"S808b"}, nullptr, kTask, kAllVersions,
-       [](C c, R r) { return SetTextAndListed(c, &r->task.s808b, &r->task.strings); }},
-      {{"S8006", "MS8007", "S8016", "S8122"}, nullptr, kTask, kAllVersions,
-       [](C c, R r) { return SetListed(c, &r->task.strings); }},
+    // Task detail. The body text is kept once, outside the list.
+    {{"T8078", "T81ef"}, kTask, kAllVersions,
+     [](C c, R r) { return SetTime(c, &r->task.times[0]); }},
+    {{"T811e", "T8079"}, kTask, kAllVersions,
+     [](C c, R r) { return SetTime(c, &r->task.times[1]); }},
+    {{"T811f", "T807a"}, kTask, kAllVersions,
+     [](C c, R r) { return SetTime(c, &r->task.times[2]); }},
+    {{"Tf"}, kTask, kAllVersions,
+     [](C c, R r) { return SetTime(c, &r->task.times[3]); }},
+    {{"T3fef"}, kTask, kAllVersions,
+     [](C c, R r) { return SetTime(c, &r->task.times[4]); }},
+    {{"T8125", "T807e"}, kTask, kAllVersions,
+     [](C c, R r) { return SetTime(c, &r->task.time_6); }},
+    {{"T39"}, kTask, kAllVersions,
+     [](C c, R r) { return SetTime(c, &r->task.time_7); }},
+    {{"B8124"}, kTask, kAllVersions,
+     [](C c, R r) { return SetBoolean(c, &r->task.flag); }},
+    {{"D8121"}, kTask, kAllVersions,
+     [](C c, R r) { return AsDouble(c, &r->task.percent_complete); }},
+    {{"L8138"}, kTask, kAllVersions,
+     [](C c, R r) { return SetInteger(c, &r->task.value); }},
+    {{"L36", "Sensitivity"}, kTask, kAllVersions,
+     [](C c, R r) { return SetInteger(c, &r->task.sensitivity); }},
+    {{"L26", "Priority"}, kTask, kAllVersions,
+     [](C c, R r) { return SetInteger(c, &r->task.priority); }},
+    {{"L3fde"}, kTask, kAllVersions,
+     [](C c, R r) { return SetInteger(c, &r->task.internet_code_page); }},
+    {{"S1000"}, kTask, kAllVersions,
+     [](C c, R r) { return SetText(c, &r->task.body_text); }},
+    {{"S814a"}, kTask, kAllVersions,
+     [](C c, R r) { return SetTextAndListed(c, &r->task.s814a, &r->task.strings); }},
+    {{"MS813a"}, kTask, kAllVersions,
+     [](C c, R r) { return SetTextAndListed(c, &r->task.ms813a, &r->task.strings); }},
+    {{"S808b"}, kTask, kAllVersions,
+     [](C c, R r) { return SetTextAndListed(c, &r->task.s808b, &r->task.strings); }},
+    {{"S8006", "MS8007", "S8016", "S8122"}, kTask, kAllVersions,
+     [](C c, R r) { return SetListed(c, &r->task.strings); }},
 
-      // Attachment rows.
-      {{"S3704", "S3001", "Name"}, nullptr, kAttachment, kAllVersions, SetAttachmentName},
-      {{"S1a", "S3707", "S3712", "S3713"}, nullptr, kAttachment, kAllVersions,
-       [](C c, R r) { return SetListed(c, &r->attachment.strings); }},
-      {{"N3701", "Content"}, nullptr, kAttachment, kAllVersions,
-       [](C c, R r) { return SetBytes(c, &r->attachment.data); }},
-      {{"J3701"}, nullptr, kAttachment, kAllVersions,
-       [](C c, R r) { return SetBytes(c, &r->attachment.further_data); }},
-      {{"F3701"}, nullptr, kAttachment, kAllVersions,
-       [](C c, R r) { return SetBytes(c, &r->attachment.stream_page_list); }},
-      {{"SubobjectsBlob"}, nullptr, kAttachment, kAllVersions,
-       [](C c, R r) { return SetBytes(c, &r->attachment.subobjects); }},
-      {{"L65f1"}, nullptr, kAttachment, kAllVersions,
-       [](C c, R r) { return SetInteger(c, &r->attachment.l65f1); }},
+    // Attachment rows.
+    {{"S3704", "S3001", "Name"}, kAttachment, kAllVersions, SetAttachmentName},
+    {{"S1a", "S3707", "S3712", "S3713"}, kAttachment, kAllVersions,
+     [](C c, R r) { return SetListed(c, &r->attachment.strings); }},
+    {{"N3701", "Content"}, kAttachment, kAllVersions,
+     [](C c, R r) { return SetBytes(c, &r->attachment.data); }},
+    {{"J3701"}, kAttachment, kAllVersions,
+     [](C c, R r) { return SetBytes(c, &r->attachment.further_data); }},
+    {{"F3701"}, kAttachment, kAllVersions,
+     [](C c, R r) { return SetBytes(c, &r->attachment.stream_page_list); }},
+    {{"SubobjectsBlob"}, kAttachment, kAllVersions,
+     [](C c, R r) { return SetBytes(c, &r->attachment.subobjects); }},
+    {{"L65f1"}, kAttachment, kAllVersions,
+     [](C c, R r) { return SetInteger(c, &r->attachment.l65f1); }},
   };
+  // clang-format on
   return rules;
 }
 
@@ -634,7 +660,9 @@ bool SplitName(std::string_view name, std::string_view* letters, uint32_t* id) {
   uint32_t v = 0;
   for (size_t k = i; k < name.size(); ++k) {
     const char ch = name[k];
-    const int digit = ch >= '0' && ch <= '9' ? ch - '0' : ch >= 'a' && ch <= 'f' ? ch - 'a' + 10 : -1;
+    const int digit = ch >= '0' && ch <= '9'   ? ch - '0'
+                      : ch >= 'a' && ch <= 'f' ? ch - 'a' + 10
+                                               : -1;
     if (digit < 0) return false;
     v = v * 16 + uint32_t(digit);
   }
@@ -667,8 +695,7 @@ std::vector<std::string> ExpandNames(const std::vector<std::string_view>& names)
 }  // namespace
 
 PropertyDecoder::PropertyDecoder(int store_version) : store_version_(store_version) {
-  const uint32_t version =
-      store_version >= 0 && store_version < 32 ? Version(store_version) : 0;
+  const uint32_t version = store_version >= 0 && store_version < 32 ? Version(store_version) : 0;
   for (const Rule& rule : Rules()) {
     if (!(rule.versions & version)) continue;
     if (rule.names.empty()) {
@@ -695,17 +722,12 @@ int PropertyDecoder::Decode(DecodePurpose purpose, std::string_view column_name,
   if (value.empty() || records == nullptr) return 0;
   const bool tree_row =
       purpose == DecodePurpose::kMailboxRow || purpose == DecodePurpose::kFolderRow;
-  Column column{purpose,
-                column_name,
-                engine_type,
-                code_page,
-                value,
-                // Binary times are little-endian when Exchange 2010 wrote them and
-                // in the rows of the folder tree.
-                store_version_ == kStoreExchange2010 || tree_row ? ByteOrder::kLittle
-                                                                 : ByteOrder::kBig,
-                std::nullopt,
-                &blob_parser_};
+  Column column{
+      purpose, column_name, engine_type, code_page, value,
+      // Binary times are little-endian when Exchange 2010 wrote them and
+      // in the rows of the folder tree.
+      store_version_ == kStoreExchange2010 || tree_row ? ByteOrder::kLittle : ByteOrder::kBig,
+      std::nullopt, &blob_parser_};
   // Mailbox and folder rows keep ids and times in binary columns typed by
   // their names; a wrong length makes the value bad whether or not a field
   // wants it.

@@ -62,11 +62,16 @@ TEST(TypedBinaryTest, NameDecidesTheKind) {
     const char* name;
     TypedKind kind;
   } cases[] = {
-      {"Tf", TypedKind::kFileTime},        {"T3007", TypedKind::kFileTime},
-      {"T123456", TypedKind::kFileTime},   {"T1234567", TypedKind::kNone},
-      {"T", TypedKind::kNone},             {"Q6748", TypedKind::kInteger64},
-      {"S3001", TypedKind::kNone},         {"q6748", TypedKind::kNone},
-      {"", TypedKind::kNone},              {"MN81a9", TypedKind::kNone},
+      {"Tf", TypedKind::kFileTime},
+      {"T3007", TypedKind::kFileTime},
+      {"T123456", TypedKind::kFileTime},
+      {"T1234567", TypedKind::kNone},
+      {"T", TypedKind::kNone},
+      {"Q6748", TypedKind::kInteger64},
+      {"S3001", TypedKind::kNone},
+      {"q6748", TypedKind::kNone},
+      {"", TypedKind::kNone},
+      {"MN81a9", TypedKind::kNone},
   };
   for (const Case& c : cases) EXPECT_EQ(TypedKindOfName(c.name), c.kind) << c.name;
 }

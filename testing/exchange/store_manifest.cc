@@ -1,0 +1,181 @@
+#include "testing/exchange/store_manifest.h"
+
+#include <openssl/evp.h>
+
+#include <cstdio>
+
+#include "base/json_writer.h"
+#include "base/text.h"
+
+namespace tarnwell::forge::exchange {
+namespace {
+
+struct IconRule {
+  const char* name;
+  int icon;
+};
+
+constexpr IconRule kIconRules[] = {
+    {"Junk E-mail", 14},    {"Inbox", 3},
+    {"Outbox", 6},          {"RSS Feeds", 17},
+    {"Sent Items", 7},      {"Drafts", 2},
+    {"Deleted Items", 16},  {"Large Mail", 15},
+    {"Unread Mail", 15},    {"Categorized Mail", 15},
+    {"Search Folders", 15}, {"Search", 15},
+    {"Calendar", 1},        {"Tasks", 8},
+    {"Journal", 4},         {"Notes", 5},
+    {"Contacts", 10},
+};
+
+std::string Hex(const Bytes& b) { return ToHex(ByteView(b)); }
+
+void Attachment(JsonWriter& w, const ManifestAttachment& a) {
+  w.BeginObject();
+  w.Key("key").String(Hex(a.key));
+  w.Key("name").String(a.name);
+  w.Key("display_name").String(a.display_name);
+  w.Key("file_name").String(a.file_name);
+  w.Key("long_file_name").String(a.long_file_name);
+  w.Key("size").Uint(a.size);
+  w.Key("sha256").String(a.sha256);
+  w.Key("long_value").Bool(a.long_value);
+  w.Key("method").Uint(a.method);
+  w.EndObject();
+}
+
+void Item(JsonWriter& w, const ManifestItem& it) {
+  w.BeginObject();
+  w.Key("key").String(Hex(it.key));
+  w.Key("class").String(it.message_class);
+  w.Key("subject").String(it.subject);
+  w.Key("subject_prefix").String(it.subject_prefix);
+  w.Key("normalized_subject").String(it.normalized_subject);
+  w.Key("sender").String(it.sender);
+  w.Key("to").String(it.to);
+  w.Key("to_shown").String(it.to_shown);
+  w.Key("sender_shown").String(it.sender_shown);
+  w.Key("created").Uint(it.created);
+  w.Key("modified").Uint(it.modified);
+  w.Key("received").Uint(it.received);
+  w.Key("flags").Uint(it.flags);
+  w.Key("importance").Uint(it.importance);
+  w.Key("has_attachments").Bool(it.has_attachments);
+  w.Key("in_msg_table").Bool(it.in_msg_table);
+  w.Key("body_text").String(it.body_text);
+  w.Key("body_html").String(it.body_html);
+  w.Key("rtf_text").String(it.rtf_text);
+  w.Key("rtf_uses_references").Bool(it.rtf_uses_references);
+  w.Key("body_long_value").Bool(it.body_long_value);
+  w.Key("headers").String(it.headers);
+  w.Key("strings").BeginObject();
+  for (const auto& [k, v] : it.strings) w.Key(k).String(v);
+  w.EndObject();
+  w.Key("times").BeginObject();
+  for (const auto& [k, v] : it.times) w.Key(k).Uint(v);
+  w.EndObject();
+  w.Key("numbers").BeginObject();
+  for (const auto& [k, v] : it.numbers) w.Key(k).Int(v);
+  w.EndObject();
+  w.Key("doubles").BeginObject();
+  for (const auto& [k, v] : it.doubles) w.Key(k).Double(v);
+  w.EndObject();
+  w.Key("members").BeginArray();
+  for (const ListMember& m : it.members) {
+    w.BeginObject();
+    w.Key("name").String(m.name);
+    w.Key("type").String(m.address_type);
+    w.Key("address").String(m.address);
+    w.EndObject();
+  }
+  w.EndArray();
+  w.Key("attachments").BeginArray();
+  for (const ManifestAttachment& a : it.attachments) Attachment(w, a);
+  w.EndArray();
+  w.EndObject();
+}
+
+void Folder(JsonWriter& w, const ManifestFolder& f) {
+  w.BeginObject();
+  w.Key("id").Uint(f.id);
+  w.Key("parent").Uint(f.parent);
+  w.Key("name").String(f.name);
+  w.Key("class").String(f.container_class);
+  w.Key("path").BeginArray();
+  for (const std::string& p : f.path) w.String(p);
+  w.EndArray();
+  w.Key("content_name").String(f.content_name);
+  w.Key("content_table").String(f.content_table);
+  w.Key("visible").Bool(f.visible);
+  w.Key("icon").Int(f.icon);
+  w.Key("row").Uint(f.row);
+  w.Key("damage").String(f.damage);
+  w.Key("item_count").Uint(f.item_count);
+  w.Key("items").BeginArray();
+  for (const ManifestItem& it : f.items) Item(w, it);
+  w.EndArray();
+  w.EndObject();
+}
+
+}  // namespace
+
+std::string Sha256Hex(ByteView data) {
+  unsigned char digest[EVP_MAX_MD_SIZE];
+  unsigned int size = 0;
+  if (!EVP_Digest(data.data(), data.size(), digest, &size, EVP_sha256(), nullptr)) return "";
+  return ToHex(ByteView(digest, size));
+}
+
+int FolderIcon(const std::string& name) {
+  std::string trimmed = name;
+  while (!trimmed.empty() && (trimmed.back() == ' ' || trimmed.back() == '\t' ||
+                              trimmed.back() == '\r' || trimmed.back() == '\n')) {
+    trimmed.pop_back();
+  }
+  for (const IconRule& rule : kIconRules) {
+    if (EqualsIgnoreAsciiCase(trimmed, rule.name)) return rule.icon;
+  }
+  return kIconOther;
+}
+
+std::string ManifestJson(const StoreManifest& m) {
+  JsonWriter w;
+  w.BeginObject();
+  w.Key("version").Int(m.version);
+  w.Key("public_store").Bool(m.public_store);
+  w.Key("page_size").Uint(m.page_size);
+  w.Key("revision").Uint(m.revision);
+  w.Key("attachment_table").String(m.attachment_table);
+  w.Key("attachment_key_column").String(m.attachment_key_column);
+  w.Key("time_encodings").BeginObject();
+  for (const auto& [k, v] : m.time_encodings) w.Key(k).String(v);
+  w.EndObject();
+  w.Key("mailboxes").BeginArray();
+  for (const ManifestMailbox& mb : m.mailboxes) {
+    w.BeginObject();
+    w.Key("name").String(mb.name);
+    w.Key("number").Uint(mb.number);
+    w.Key("property").String(Hex(mb.property));
+    w.Key("row").Uint(mb.row);
+    w.EndObject();
+  }
+  w.EndArray();
+  w.Key("folders").BeginArray();
+  for (const ManifestFolder& f : m.folders) Folder(w, f);
+  w.EndArray();
+  w.Key("duplicates").BeginArray();
+  for (const DuplicateRow& d : m.duplicates) {
+    w.BeginObject();
+    w.Key("key").String(Hex(d.key));
+    w.Key("subject").String(d.subject);
+    w.EndObject();
+  }
+  w.EndArray();
+  w.Key("msg_rows").Uint(m.msg_rows);
+  w.Key("messages").Uint(m.messages);
+  w.Key("attachment_rows").Uint(m.attachment_rows);
+  w.Key("items_recorded").Bool(m.items_recorded);
+  w.EndObject();
+  return w.str() + "\n";
+}
+
+}  // namespace tarnwell::forge::exchange
