@@ -6,7 +6,7 @@
 #include "base/date_time.h"
 #include "base/text.h"
 #include "engine/catalog_entry.h"
-#include "render/rtf_decompressor.h"
+#include "store/rtf_decompressor.h"
 #include "store/distribution_list.h"
 #include "store/typed_binary.h"
 
@@ -355,7 +355,7 @@ int SetNativeBody(C c, R r) {
 }
 
 int SetRtfBody(C c, R r) {
-  std::optional<render::RtfText> rtf = render::DecompressRtf(c.value);
+  std::optional<store::RtfText> rtf = store::DecompressRtf(c.value);
   if (!rtf) return -1;
   r->message.rtf_body = std::move(rtf->text);
   r->message.rtf_compressed_length = c.value.size();

@@ -6,7 +6,7 @@
 
 #include <string>
 
-#include "render/rtf_decompressor.h"
+#include "store/rtf_decompressor.h"
 
 namespace tarnwell::forge::exchange {
 namespace {
@@ -52,8 +52,8 @@ TEST_P(RtfEncoderTest, BothEncodersRoundTripThroughTheDecoder) {
     EXPECT_EQ(LoadU32LE(value.data()), value.size() - 4);
     EXPECT_EQ(LoadU32LE(value.data() + 4), text.size());
     EXPECT_EQ(LoadU32LE(value.data() + 8), kRtfTypeCompressed);
-    EXPECT_EQ(render::CheckRtfCrc(ByteView(value)), render::RtfCrcStatus::kMatch);
-    const auto decoded = render::DecompressRtf(ByteView(value));
+    EXPECT_EQ(store::CheckRtfCrc(ByteView(value)), store::RtfCrcStatus::kMatch);
+    const auto decoded = store::DecompressRtf(ByteView(value));
     ASSERT_TRUE(decoded.has_value());
     EXPECT_TRUE(decoded->complete);
     const ByteView body = decoded->body();

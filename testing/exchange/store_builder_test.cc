@@ -17,7 +17,7 @@
 #include "base/text.h"
 #include "engine/column_decoder.h"
 #include "engine/edb_class.h"
-#include "render/rtf_decompressor.h"
+#include "store/rtf_decompressor.h"
 
 namespace tarnwell::forge::exchange {
 namespace {
@@ -282,8 +282,8 @@ TEST_P(StoreReadBackTest, MessagesContentTablesAndAttachmentsMatch) {
       if (it.rtf_text.empty()) {
         EXPECT_TRUE(rtf.empty());
       } else {
-        EXPECT_EQ(render::CheckRtfCrc(ByteView(rtf)), render::RtfCrcStatus::kMatch);
-        const auto text = render::DecompressRtf(ByteView(rtf));
+        EXPECT_EQ(store::CheckRtfCrc(ByteView(rtf)), store::RtfCrcStatus::kMatch);
+        const auto text = store::DecompressRtf(ByteView(rtf));
         ASSERT_TRUE(text.has_value());
         const ByteView body = text->body();
         EXPECT_EQ(std::string(reinterpret_cast<const char*>(body.data()), body.size()),

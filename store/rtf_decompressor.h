@@ -20,8 +20,8 @@
 // position just after it. References are copied one byte at a time, so a
 // reference may overlap the write position and repeat what it is producing.
 // A reference whose offset equals the write position ends the stream.
-#ifndef TARNWELL_RENDER_RTF_DECOMPRESSOR_H_
-#define TARNWELL_RENDER_RTF_DECOMPRESSOR_H_
+#ifndef TARNWELL_STORE_RTF_DECOMPRESSOR_H_
+#define TARNWELL_STORE_RTF_DECOMPRESSOR_H_
 
 #include <cstddef>
 #include <cstdint>
@@ -30,7 +30,7 @@
 
 #include "base/byte_view.h"
 
-namespace tarnwell::render {
+namespace tarnwell::store {
 
 inline constexpr size_t kRtfHeaderSize = 16;
 inline constexpr uint32_t kRtfCompressed = 0x75465A4C;    // "LZFu"
@@ -87,6 +87,6 @@ enum class RtfCrcStatus {
 // bytes. For callers that want to know; the decoder never looks at the CRC.
 RtfCrcStatus CheckRtfCrc(ByteView value);
 
-}  // namespace tarnwell::render
+}  // namespace tarnwell::store
 
-#endif  // TARNWELL_RENDER_RTF_DECOMPRESSOR_H_
+#endif  // TARNWELL_STORE_RTF_DECOMPRESSOR_H_

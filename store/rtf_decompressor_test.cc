@@ -1,4 +1,4 @@
-#include "render/rtf_decompressor.h"
+#include "store/rtf_decompressor.h"
 
 #include <gtest/gtest.h>
 
@@ -8,7 +8,7 @@
 #include <random>
 #include <string>
 
-namespace tarnwell::render {
+namespace tarnwell::store {
 namespace {
 
 // Two bodies as Outlook stores them, with the text they decode to. The
@@ -258,4 +258,4 @@ TEST(RtfDecompressorTest, RealMessageBody) {
 }
 
 }  // namespace
-}  // namespace tarnwell::render
+}  // namespace tarnwell::store

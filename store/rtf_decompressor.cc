@@ -1,10 +1,10 @@
-#include "render/rtf_decompressor.h"
+#include "store/rtf_decompressor.h"
 
 #include <algorithm>
 #include <array>
 #include <utility>
 
-namespace tarnwell::render {
+namespace tarnwell::store {
 
 namespace {
 
@@ -148,4 +148,4 @@ RtfCrcStatus CheckRtfCrc(ByteView value) {
                                                      : RtfCrcStatus::kMismatch;
 }
 
-}  // namespace tarnwell::render
+}  // namespace tarnwell::store
