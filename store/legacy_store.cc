@@ -160,6 +160,7 @@ bool LegacyStore::WalkKeyedTable(const engine::TableDef& table, const std::strin
     return true;
   });
   std::vector<uint64_t> dropped = map->Finish();
+  locations->Flush();
   if (!dropped.empty()) {
     // Repeated keys got no ordinal: keep the file dense, ordinal k at k - 1.
     LocationFile compact;

@@ -45,6 +45,10 @@ Status LocationFile::Append(const RecordLocation& location) {
   return Status::Ok();
 }
 
+void LocationFile::Flush() {
+  if (file_) std::fflush(file_);
+}
+
 std::optional<RecordLocation> LocationFile::Read(uint64_t ordinal) {
   if (!file_ || ordinal == 0 || ordinal > count_) return std::nullopt;
   uint8_t entry[kRecordLocationSize];

@@ -43,6 +43,8 @@ class LocationFile {
 
   // Appends the entry of the next ordinal.
   Status Append(const RecordLocation& location);
+  // Writes buffered entries to the file, for readers of the file itself.
+  void Flush();
   // The entry of ordinal k (from 1); nothing past the end.
   std::optional<RecordLocation> Read(uint64_t ordinal);
   uint64_t count() const { return count_; }
