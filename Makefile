@@ -13,10 +13,12 @@ build: setup
 	cmake -S . -B $(BUILD) -G Ninja $(CMAKE_FLAGS)
 	cmake --build $(BUILD) -j $(JOBS)
 
-# The main job on a bundled sample: a database the test writer generates at
-# build time.
+# The main job on a bundled sample: an Exchange 2007 mailbox database the
+# test store builder generates at build time, scanned, with its Inbox listed.
 demo: build
-	$(BUILD)/cli/tarnwell info $(BUILD)/samples/sample.edb
+	$(BUILD)/cli/tarnwell info $(BUILD)/samples/exchange2007.edb
+	$(BUILD)/cli/tarnwell scan $(BUILD)/samples/exchange2007.edb
+	$(BUILD)/cli/tarnwell list $(BUILD)/samples/exchange2007.edb --folder 1000000000a31
 
 test: build
 	ctest --test-dir $(BUILD) --output-on-failure -j $(JOBS)

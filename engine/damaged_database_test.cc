@@ -125,6 +125,7 @@ Outcome RunStages(const Bytes& bytes, int version) {
 
   reader->ScanLeafPages();
   out.leaf_pages = reader->leaf_pages().size();
+  reader->set_harvest_catalog_only(false);  // every tree's records, to check them all
   EXPECT_EQ(reader->CollectLeafPageRecords(), 1);
   for (const RecordRef& r : reader->records()) {
     if (!out.harvested.insert({r.page_number, r.tag_index}).second) ++out.harvested_twice;

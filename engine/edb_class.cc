@@ -140,8 +140,19 @@ int EdbClass::CollectTreeRecords(uint32_t page_number) {
   });
 }
 
+uint32_t EdbClass::CatalogObjectId() const {
+  // The catalog's object id as its root page states it; the engine's own
+  // number when page 4 is not a sound root.
+  Page root;
+  if (ReadPage(kCatalogRootPage, &root) && root.is_root() && root.header().object_id != 0) {
+    return root.header().object_id;
+  }
+  return kCatalogObjectId;
+}
+
 int EdbClass::CollectLeafPageRecords() {
   LeafHarvest harvest(file_, *progress_, *running_, &records_);
+  if (harvest_catalog_only_) harvest.set_object_filter(CatalogObjectId());
   int result = harvest.CollectLeafPageRecords(leaf_pages_);
   leaf_pages_.clear();
   leaf_pages_.shrink_to_fit();
@@ -163,11 +174,7 @@ int EdbClass::ParseCatalogRecords() {
   // file; only those on pages of the catalog's own tree are catalog records.
   // (Other tables' records can look like catalog records and would file
   // bogus columns under the last table.)
-  uint32_t catalog_object = kCatalogObjectId;
-  Page root;
-  if (ReadPage(kCatalogRootPage, &root) && root.is_root() && root.header().object_id != 0) {
-    catalog_object = root.header().object_id;
-  }
+  const uint32_t catalog_object = CatalogObjectId();
   // References come grouped by page: keep the last page read.
   Page page;
   uint32_t page_number = 0;

@@ -94,6 +94,10 @@ class EdbClass {
   // Mode); the list is emptied.
   int CollectLeafPageRecords();
   bool FollowLeafChain(uint32_t page_number);
+  // By default the harvest keeps only the catalog's records (all that the
+  // catalog stage reads); off keeps every leaf record of every tree.
+  void set_harvest_catalog_only(bool only) { harvest_catalog_only_ = only; }
+  uint32_t CatalogObjectId() const;
   std::vector<RecordRef>& records() { return records_; }
 
   // Decodes the record vector as catalog records into the table list and
@@ -151,6 +155,7 @@ class EdbClass {
   std::vector<TableDef> tables_;
   std::vector<std::string> table_names_;
   bool extended_catalog_ = false;
+  bool harvest_catalog_only_ = true;
 
  private:
   void ReadHeader(uint64_t base_offset);

@@ -15,6 +15,7 @@ bool BranchWithSiblings(const Page& page) {
 }  // namespace
 
 void LeafHarvest::PushNodes(const Page& page, uint32_t page_number) {
+  if (object_filter_ != 0 && page.header().object_id != object_filter_) return;
   const auto& nodes = page.nodes();
   for (size_t tag = 1; tag < nodes.size(); ++tag) {
     if (!running_.load()) return;

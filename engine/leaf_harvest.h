@@ -37,6 +37,10 @@ class LeafHarvest {
   // Keys are not copied by default: the catalog needs none, and millions of
   // references must stay small.
   void set_want_keys(bool want) { want_keys_ = want; }
+  // Keeps only the records of pages that belong to this tree (0: all). The
+  // catalog harvest of a large mailbox database would otherwise hold a
+  // reference for every message in memory.
+  void set_object_filter(uint32_t object_id) { object_filter_ = object_id; }
 
  private:
   void PushNodes(const Page& page, uint32_t page_number);
@@ -47,6 +51,7 @@ class LeafHarvest {
   std::vector<RecordRef>* records_;
   std::set<uint32_t> visited_;
   bool want_keys_ = false;
+  uint32_t object_filter_ = 0;
 };
 
 }  // namespace tarnwell::engine
