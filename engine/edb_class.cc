@@ -236,10 +236,9 @@ bool EdbClass::ReadPage(uint32_t page_number, Page* page) const {
 
 NodeCopy EdbClass::ReadNode(uint32_t page_number, uint16_t tag) const {
   NodeCopy copy;
-  Page page;
-  if (!ReadPage(page_number, &page)) return copy;
-  if (tag >= page.nodes().size()) return copy;
-  const NodeEntry& node = page.nodes()[tag];
+  std::shared_ptr<const Page> page = file_.Fetch(page_number);
+  if (!page || tag >= page->nodes().size()) return copy;
+  const NodeEntry& node = page->nodes()[tag];
   copy.data = node.bytes.ToBytes();
   copy.size = node.size;
   copy.offset = node.offset;
@@ -256,12 +255,13 @@ int EdbClass::LoadPageNodes(PageRecord* record) const {
 
 RecordRef EdbClass::MakeRecordRef(uint32_t page_number, uint16_t tag) const {
   RecordRef ref;
-  Page page;
-  if (!ReadPage(page_number, &page)) return ref;
-  if (DecodeNode(page, tag, &ref) != NodeDecode::kOk) return RecordRef();
+  std::shared_ptr<const Page> page = file_.Fetch(page_number);
+  if (!page) return ref;
+  if (DecodeNode(*page, tag, &ref) != NodeDecode::kOk) return RecordRef();
   ref.page_number = page_number;
-  ref.kind = page.is_leaf() ? LeafKind(page.flags()) : char(kKindNone);
-  ref.file_position = RecordFilePosition(file_, page_number, page.nodes()[tag].offset);
+  ref.object_id = page->header().object_id;
+  ref.kind = page->is_leaf() ? LeafKind(page->flags()) : char(kKindNone);
+  ref.file_position = RecordFilePosition(file_, page_number, page->nodes()[tag].offset);
   return ref;
 }
 
@@ -274,10 +274,9 @@ TaggedForm EdbClass::tagged_form() const {
 int EdbClass::ReadRecordColumns(const RecordRef& ref, const TableDef& table,
                                 const TableDef* template_table, RecordColumns* out) const {
   if (ref.kind != kKindRecord) return -1;
-  Page page;
-  if (!ReadPage(ref.page_number, &page)) return -1;
-  if (ref.tag_index >= page.nodes().size()) return -1;
-  const NodeEntry& node = page.nodes()[ref.tag_index];
+  std::shared_ptr<const Page> page = file_.Fetch(ref.page_number);
+  if (!page || ref.tag_index >= page->nodes().size()) return -1;
+  const NodeEntry& node = page->nodes()[ref.tag_index];
   if (ref.data_offset > node.size) return -1;
   ByteView record = node.bytes.From(ref.data_offset);
   if (record.size() < kRecordHeaderSize) return -1;

@@ -102,6 +102,12 @@ class Page {
   // Takes the page's bytes (exactly one page size long) and decodes its
   // header and node table. Never reads outside `bytes`.
   Page(Bytes bytes, PageFamily family);
+  // Node entries point into the page's own bytes: a copy would point into
+  // the original, so pages move but never copy.
+  Page(const Page&) = delete;
+  Page& operator=(const Page&) = delete;
+  Page(Page&&) = default;
+  Page& operator=(Page&&) = default;
 
   const PageHeader& header() const { return header_; }
   uint32_t flags() const { return header_.flags; }

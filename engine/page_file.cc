@@ -20,10 +20,16 @@ Status PageFile::Open(const std::string& path, uint32_t page_size, PageFamily fa
   total_pages_ = file_length_ / page_size_;
   adjustment_ = 0;
   missing_pages_ = 0;
+  std::lock_guard<std::mutex> lock(cache_mutex_);
+  cache_.clear();
   return Status::Ok();
 }
 
 void PageFile::SetAdjustment(int64_t adjustment) {
+  {
+    std::lock_guard<std::mutex> lock(cache_mutex_);
+    cache_.clear();  // pages now lie elsewhere
+  }
   adjustment_ = adjustment;
   missing_pages_ = adjustment < 0 ? uint32_t(uint64_t(-adjustment) / page_size_ + 1) : 0;
 }
@@ -63,6 +69,31 @@ Status PageFile::ReadPage(uint64_t page_number, Page* page) const {
   }
   *page = Page(std::move(bytes), family_);
   return Status::Ok();
+}
+
+std::shared_ptr<const Page> PageFile::Fetch(uint64_t page_number) const {
+  {
+    std::lock_guard<std::mutex> lock(cache_mutex_);
+    for (CacheSlot& slot : cache_) {
+      if (slot.page && slot.page_number == page_number) {
+        slot.last_use = ++cache_clock_;
+        return slot.page;
+      }
+    }
+  }
+  auto page = std::make_shared<Page>();
+  if (!ReadPage(page_number, page.get()).ok()) return nullptr;
+  std::lock_guard<std::mutex> lock(cache_mutex_);
+  if (cache_.size() < kCacheSlots) {
+    cache_.push_back({page_number, ++cache_clock_, page});
+  } else {
+    CacheSlot* oldest = &cache_[0];
+    for (CacheSlot& slot : cache_) {
+      if (slot.last_use < oldest->last_use) oldest = &slot;
+    }
+    *oldest = {page_number, ++cache_clock_, page};
+  }
+  return page;
 }
 
 }  // namespace tarnwell::engine

@@ -13,7 +13,10 @@
 #define TARNWELL_ENGINE_PAGE_FILE_H_
 
 #include <cstdint>
+#include <memory>
+#include <mutex>
 #include <string>
+#include <vector>
 
 #include "base/read_only_file.h"
 #include "base/status.h"
@@ -63,6 +66,11 @@ class PageFile {
   // when its sibling numbers exceed the total page count.
   Status ReadPage(uint64_t page_number, Page* page) const;
 
+  // The same page through a small cache of recently read pages: the pages
+  // near the top of a tree are read again for every key searched. Nothing
+  // when the page cannot be read or is rejected.
+  std::shared_ptr<const Page> Fetch(uint64_t page_number) const;
+
   // Reads raw bytes at a file position (base offset not added); bytes past the
   // end are left untouched. Returns the count read.
   size_t ReadAt(int64_t position, uint8_t* out, size_t length) const;
@@ -76,6 +84,16 @@ class PageFile {
   uint64_t base_offset_ = 0;
   int64_t adjustment_ = 0;
   uint32_t missing_pages_ = 0;
+
+  struct CacheSlot {
+    uint64_t page_number = 0;
+    uint64_t last_use = 0;
+    std::shared_ptr<const Page> page;
+  };
+  static constexpr size_t kCacheSlots = 64;
+  mutable std::mutex cache_mutex_;
+  mutable std::vector<CacheSlot> cache_;
+  mutable uint64_t cache_clock_ = 0;
 };
 
 // True when a page header's sibling numbers are possible in a file of

@@ -43,21 +43,22 @@ bool TreeCursor::Descend(uint32_t page_number, ByteView key, int depth) {
     damaged_ = true;
     return false;
   }
-  Page page;
-  if (!file_.ReadPage(page_number, &page).ok()) {
+  std::shared_ptr<const Page> fetched = file_.Fetch(page_number);
+  if (!fetched) {
     damaged_ = true;
     return false;
   }
+  const Page& page = *fetched;
   if (page.is_leaf()) {
-    page_ = std::move(page);
+    page_ = std::move(fetched);
     page_number_ = page_number;
     // The first node at or after the key, else the last node (Seek then
     // steps along the chain).
-    const auto& nodes = page_.nodes();
+    const auto& nodes = page_->nodes();
     size_t last_ok = 0;
     RecordRef ref;  // reused: keeps its key buffer
     for (size_t tag = 1; tag < nodes.size(); ++tag) {
-      if (DecodeNode(page_, uint16_t(tag), &ref) != NodeDecode::kOk) continue;
+      if (DecodeNode(*page_, uint16_t(tag), &ref) != NodeDecode::kOk) continue;
       last_ok = tag;
       if (CompareKeys(ByteView(ref.key), key) >= 0) return SettleFrom(tag);
     }
@@ -83,21 +84,21 @@ bool TreeCursor::Descend(uint32_t page_number, ByteView key, int depth) {
 bool TreeCursor::SettleFrom(size_t tag) {
   valid_ = false;
   for (;;) {
-    const auto& nodes = page_.nodes();
+    const auto& nodes = page_->nodes();
     for (size_t t = tag; t < nodes.size(); ++t) {
       RecordRef ref;
-      if (DecodeNode(page_, uint16_t(t), &ref) != NodeDecode::kOk) continue;
+      if (DecodeNode(*page_, uint16_t(t), &ref) != NodeDecode::kOk) continue;
       ref.page_number = page_number_;
-      ref.kind = LeafKind(page_.flags());
+      ref.kind = LeafKind(page_->flags());
       ref.file_position = RecordFilePosition(file_, page_number_, nodes[t].offset);
       ref_ = std::move(ref);
       valid_ = true;
       return true;
     }
-    const uint32_t next = page_.header().next;
+    const uint32_t next = page_->header().next;
     if (next == 0 || !seen_.insert(next).second) return false;
-    Page page;
-    if (!file_.ReadPage(next, &page).ok() || !page.is_leaf()) {
+    std::shared_ptr<const Page> page = file_.Fetch(next);
+    if (!page || !page->is_leaf()) {
       damaged_ = true;
       return false;
     }
@@ -113,7 +114,8 @@ bool TreeCursor::Next() {
 }
 
 int64_t TreeCursor::data_position() const {
-  const auto& nodes = page_.nodes();
+  if (!page_) return -1;
+  const auto& nodes = page_->nodes();
   if (!valid_ || ref_.tag_index >= nodes.size()) return -1;
   return file_.PagePosition(page_number_) + nodes[ref_.tag_index].offset + ref_.data_offset;
 }

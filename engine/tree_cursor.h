@@ -14,6 +14,7 @@
 #define TARNWELL_ENGINE_TREE_CURSOR_H_
 
 #include <cstdint>
+#include <memory>
 #include <unordered_set>
 
 #include "base/byte_view.h"
@@ -38,9 +39,9 @@ class TreeCursor {
 
   bool valid() const { return valid_; }
   const RecordRef& ref() const { return ref_; }
-  const Page& page() const { return page_; }
+  const Page& page() const { return *page_; }
   ByteView key() const { return ByteView(ref_.key); }
-  ByteView data() const { return NodeData(page_, ref_); }
+  ByteView data() const { return page_ ? NodeData(*page_, ref_) : ByteView(); }
   // Byte position of the node's data part in the file.
   int64_t data_position() const;
   // Whether the seek or walk met a damaged tree.
@@ -55,7 +56,7 @@ class TreeCursor {
   bool SettleFrom(size_t tag);
 
   const PageFile& file_;
-  Page page_;
+  std::shared_ptr<const Page> page_;
   uint32_t page_number_ = 0;
   RecordRef ref_;
   bool valid_ = false;

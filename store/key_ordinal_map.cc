@@ -12,42 +12,65 @@ uint64_t KeyOrdinalMap::Add(uint64_t key) {
 }
 
 std::vector<uint64_t> KeyOrdinalMap::Finish() {
+  // Everything happens in place, so that a map of millions of keys never
+  // needs much more than its final 12 bytes a key.
   const size_t n = keys_.size();
+  constexpr uint32_t kVisited = 0x80000000u;
+  constexpr size_t kWordBits = 64;
   // Walk positions sorted by (key, position): the first of equal keys is the
   // one that keeps an ordinal.
   ordinals_.resize(n);
   std::iota(ordinals_.begin(), ordinals_.end(), 0u);
-  std::stable_sort(ordinals_.begin(), ordinals_.end(),
-                   [this](uint32_t a, uint32_t b) { return keys_[a] < keys_[b]; });
-  std::vector<bool> dropped(n, false);
+  std::sort(ordinals_.begin(), ordinals_.end(), [this](uint32_t a, uint32_t b) {
+    return keys_[a] != keys_[b] ? keys_[a] < keys_[b] : a < b;
+  });
+  std::vector<uint64_t> dropped_bits((n + kWordBits - 1) / kWordBits, 0);
   for (size_t i = 1; i < n; ++i) {
-    if (keys_[ordinals_[i]] == keys_[ordinals_[i - 1]]) dropped[ordinals_[i]] = true;
-  }
-  // Ordinal of a kept position = 1 + kept positions before it.
-  std::vector<uint64_t> dropped_positions;
-  std::vector<uint32_t> rank(n, 0);
-  uint32_t next = 0;
-  for (size_t p = 0; p < n; ++p) {
-    if (dropped[p]) {
-      dropped_positions.push_back(p + 1);
-    } else {
-      rank[p] = ++next;
+    if (keys_[ordinals_[i]] == keys_[ordinals_[i - 1]]) {
+      dropped_bits[ordinals_[i] / kWordBits] |= uint64_t(1) << (ordinals_[i] % kWordBits);
     }
   }
-  // Sorted keys with their ordinals, repeats removed.
-  std::vector<uint64_t> sorted_keys;
-  std::vector<uint32_t> sorted_ordinals;
-  sorted_keys.reserve(next);
-  sorted_ordinals.reserve(next);
-  for (uint32_t p : ordinals_) {
-    if (dropped[p]) continue;
-    sorted_keys.push_back(keys_[p]);
-    sorted_ordinals.push_back(rank[p]);
+  // Put the keys in sorted order by following the permutation's cycles; the
+  // top bit marks entries already placed.
+  for (size_t i = 0; i < n; ++i) {
+    if (ordinals_[i] & kVisited) continue;
+    const uint64_t first = keys_[i];
+    size_t j = i;
+    for (;;) {
+      const size_t from = ordinals_[j] & ~kVisited;
+      ordinals_[j] |= kVisited;
+      if (from == i) {
+        keys_[j] = first;
+        break;
+      }
+      keys_[j] = keys_[from];
+      j = from;
+    }
   }
-  keys_ = std::move(sorted_keys);
-  ordinals_ = std::move(sorted_ordinals);
-  keys_.shrink_to_fit();
-  ordinals_.shrink_to_fit();
+  // Ordinal of a kept walk position p = p + 1 - (dropped positions before p).
+  std::vector<uint32_t> dropped_before(dropped_bits.size(), 0);
+  for (size_t w = 1; w < dropped_bits.size(); ++w) {
+    dropped_before[w] = dropped_before[w - 1] + uint32_t(__builtin_popcountll(dropped_bits[w - 1]));
+  }
+  auto is_dropped = [&](size_t p) { return (dropped_bits[p / kWordBits] >> (p % kWordBits)) & 1; };
+  size_t kept = 0;
+  for (size_t i = 0; i < n; ++i) {
+    const size_t p = ordinals_[i] & ~kVisited;
+    if (is_dropped(p)) continue;
+    const uint64_t below = p % kWordBits ? dropped_bits[p / kWordBits] & ((uint64_t(1) << (p % kWordBits)) - 1) : 0;
+    const uint32_t dropped = dropped_before[p / kWordBits] + uint32_t(__builtin_popcountll(below));
+    keys_[kept] = keys_[i];
+    ordinals_[kept] = uint32_t(p + 1 - dropped);
+    ++kept;
+  }
+  std::vector<uint64_t> dropped_positions;
+  for (size_t p = 0; p < n; ++p) {
+    if (is_dropped(p)) dropped_positions.push_back(p + 1);
+  }
+  // No shrink_to_fit: it would copy both arrays, and spare capacity that
+  // was never written costs no memory.
+  keys_.resize(kept);
+  ordinals_.resize(kept);
   finished_ = true;
   return dropped_positions;
 }

@@ -285,11 +285,26 @@ ItemRecords LegacyStore::OpenItem(const engine::TableDef& table, const engine::R
 std::optional<ItemRecords> LegacyStore::OpenMessage(uint64_t message_key, DecodePurpose* purpose) {
   std::optional<engine::RecordRef> ref = FindMessage(message_key);
   if (!ref) return std::nullopt;
-  // The class decides the purpose: read it first with the list columns.
-  ItemRecords head = OpenItem(*message_table_, *ref, DecodePurpose::kMessageListRow);
-  *purpose = PurposeForClass(head.summary.message_class);
-  ItemRecords records = OpenItem(*message_table_, *ref, *purpose);
-  records.summary = std::move(head.summary);
+  engine::RecordColumns columns;
+  if (reader_.ReadRecordColumns(*ref, *message_table_, nullptr, &columns) != 0) {
+    return std::nullopt;
+  }
+  // Every value is read once; the class among them decides the purpose.
+  const engine::LongValueReader lv = reader_.long_values();
+  RowValueReader reader(lv, *message_table_);
+  std::vector<RowValue> values = reader.Read(columns);
+  ItemRecords records;
+  for (const RowValue& v : values) {
+    const std::string& name = v.column->name;
+    if (std::find(ListColumns().begin(), ListColumns().end(), name) == ListColumns().end()) continue;
+    decoder_.Decode(DecodePurpose::kMessageListRow, name, v.engine_type, v.code_page,
+                    ByteView(v.bytes), &records);
+  }
+  *purpose = PurposeForClass(records.summary.message_class);
+  for (const RowValue& v : values) {
+    decoder_.Decode(*purpose, v.column->name, v.engine_type, v.code_page, ByteView(v.bytes),
+                    &records);
+  }
   return records;
 }
 
