@@ -23,17 +23,38 @@ bool IsLowSurrogate(char32_t u) { return u >= kLowSurrogateFirst && u <= kLowSur
 // Shared by the byte and the char16_t front ends; unit(i) returns the i-th code unit.
 template <typename UnitAt>
 std::string Utf16UnitsToUtf8(size_t count, UnitAt unit, NulHandling nul) {
-  std::string out;
-  out.reserve(count);
+  // Written into a buffer sized for the worst case (3 bytes a unit; a pair
+  // of units makes 4), then cut to length: no growth checks per byte.
+  constexpr size_t kMaxBytesPerUnit = 3;
+  std::string out(count * kMaxBytesPerUnit, '\0');
+  char* o = out.data();
   for (size_t i = 0; i < count; ++i) {
     char32_t u = unit(i);
-    if (u == 0 && nul == NulHandling::kStopAtFirst) break;
+    if (u < 0x80) {
+      if (u == 0 && nul == NulHandling::kStopAtFirst) break;
+      *o++ = char(u);
+      continue;
+    }
     if (IsHighSurrogate(u) && i + 1 < count && IsLowSurrogate(unit(i + 1))) {
       char32_t low = unit(++i);
       u = kSupplementaryFirst + ((u - kHighSurrogateFirst) << 10) + (low - kLowSurrogateFirst);
     }
-    AppendUtf8(u, &out);  // a surrogate left over here is unpaired: U+FFFD
+    if (u >= kHighSurrogateFirst && u <= kLowSurrogateLast) u = kReplacementChar;  // unpaired
+    if (u < 0x800) {
+      *o++ = char(0xC0 | (u >> 6));
+      *o++ = char(0x80 | (u & 0x3F));
+    } else if (u < kSupplementaryFirst) {
+      *o++ = char(0xE0 | (u >> 12));
+      *o++ = char(0x80 | ((u >> 6) & 0x3F));
+      *o++ = char(0x80 | (u & 0x3F));
+    } else {
+      *o++ = char(0xF0 | (u >> 18));
+      *o++ = char(0x80 | ((u >> 12) & 0x3F));
+      *o++ = char(0x80 | ((u >> 6) & 0x3F));
+      *o++ = char(0x80 | (u & 0x3F));
+    }
   }
+  out.resize(size_t(o - out.data()));
   return out;
 }
 

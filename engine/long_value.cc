@@ -33,7 +33,8 @@ std::optional<uint64_t> DeclaredSize(ByteView chunk) {
 
 }  // namespace
 
-int LongValueReader::Read(uint32_t root_page, ByteView id, LongValue* out) const {
+int LongValueReader::Collect(uint32_t root_page, ByteView id, LongValue* out,
+                             std::vector<Bytes>* stored) const {
   if (id.size() != kLongValueIdSize && id.size() != kLongValueId64Size) return -1;
   *out = LongValue();
   Bytes key(id.data(), id.data() + id.size());
@@ -52,6 +53,7 @@ int LongValueReader::Read(uint32_t root_page, ByteView id, LongValue* out) const
     std::optional<uint64_t> declared;  // decoded size, if it reads as compressed
   };
   std::vector<Found> found;
+  std::vector<Bytes> bytes;
   while (cursor.Next()) {
     ByteView k = cursor.key();
     if (k.size() != key.size() + kChunkOffsetSize ||
@@ -61,6 +63,7 @@ int LongValueReader::Read(uint32_t root_page, ByteView id, LongValue* out) const
     found.push_back({LoadU32BE(k.data() + key.size()), cursor.data_position(),
                      uint32_t(cursor.data().size()),
                      compressible_ ? DeclaredSize(cursor.data()) : std::nullopt});
+    if (stored) bytes.push_back(cursor.data().ToBytes());
   }
 
   for (size_t i = 0; i < found.size(); ++i) {
@@ -88,6 +91,7 @@ int LongValueReader::Read(uint32_t root_page, ByteView id, LongValue* out) const
     chunk.logical_size = logical;
     chunk.compressed = logical != f.size;
     out->chunks.push_back(chunk);
+    if (stored) stored->push_back(std::move(bytes[i]));
     out->total_size += logical;
     if (i + 1 < found.size() && out->total_size < found[i + 1].offset) {
       out->truncated = true;  // the chunk after this one is missing
@@ -95,6 +99,33 @@ int LongValueReader::Read(uint32_t root_page, ByteView id, LongValue* out) const
     }
   }
   if (out->declared_size && out->total_size < out->declared_size) out->truncated = true;
+  return 0;
+}
+
+int LongValueReader::Read(uint32_t root_page, ByteView id, LongValue* out) const {
+  return Collect(root_page, id, out, nullptr);
+}
+
+int LongValueReader::ReadValue(uint32_t root_page, ByteView id, WholeValue* out,
+                               uint64_t limit) const {
+  *out = WholeValue();
+  LongValue lv;
+  std::vector<Bytes> stored;
+  if (Collect(root_page, id, &lv, &stored) != 0) return -1;
+  if (lv.total_size > limit) return -1;
+  out->truncated = lv.truncated;
+  out->bytes.reserve(lv.total_size);
+  for (size_t i = 0; i < lv.chunks.size(); ++i) {
+    const LongValueChunk& c = lv.chunks[i];
+    if (!c.compressed) {
+      out->bytes.insert(out->bytes.end(), stored[i].begin(), stored[i].end());
+      continue;
+    }
+    DecodedValue d = DecodeCompressedValue(ByteView(stored[i]));
+    if (!d.ok()) out->damaged = true;
+    d.bytes.resize(c.logical_size, 0);  // later chunks stay at their offsets
+    out->bytes.insert(out->bytes.end(), d.bytes.begin(), d.bytes.end());
+  }
   return 0;
 }
 

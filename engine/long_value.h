@@ -60,12 +60,27 @@ class LongValueReader {
   // refused (an id of any other size) or not found.
   int Read(uint32_t root_page, ByteView id, LongValue* out) const;
 
+  // Assembles and reads a whole value in one pass over its tree, for callers
+  // that want the bytes now: the chunks are copied from the pages as they
+  // are met instead of being read again. -1 refused or not found; 0 read
+  // (`truncated` set when chunks were missing, `damaged` when a compressed
+  // chunk could not be expanded). Values over `limit` bytes are refused.
+  struct WholeValue {
+    Bytes bytes;
+    bool truncated = false;
+    bool damaged = false;
+  };
+  int ReadValue(uint32_t root_page, ByteView id, WholeValue* out,
+                uint64_t limit = uint64_t(1) << 31) const;
+
   // The logical bytes of chunk i, decompressed when compressed.
   Status ReadChunk(const LongValue& value, size_t index, Bytes* out) const;
   // The whole value; refuses values larger than `limit` bytes.
   Status ReadAll(const LongValue& value, Bytes* out, uint64_t limit = uint64_t(1) << 31) const;
 
  private:
+  int Collect(uint32_t root_page, ByteView id, LongValue* out, std::vector<Bytes>* stored) const;
+
   const PageFile& file_;
   bool compressible_;
 };

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cstring>
+#include <optional>
 
 #include "engine/tree_walk.h"
 
@@ -25,6 +26,50 @@ static bool BelongsUnder(ByteView key, ByteView separator) {
   int c = n ? std::memcmp(key.data(), separator.data(), n) : 0;
   return c <= 0;
 }
+
+namespace {
+
+// The key of node `tag`, deleted or not: deleted nodes keep their place in
+// key order. False when the node cannot be decoded.
+bool NodeKeyAt(const Page& page, size_t tag, RecordRef* scratch) {
+  NodeDecode d = DecodeNode(page, uint16_t(tag), scratch);
+  if (d == NodeDecode::kOk) return true;
+  if (d != NodeDecode::kDeleted) return false;
+  // Decode the key of a deleted node as if it were live.
+  const NodeEntry& node = page.nodes()[tag];
+  ByteView b = node.bytes;
+  size_t cursor = 0;
+  uint16_t prefix = 0, suffix = 0;
+  if (node.flags & kNodeFlagPrefix) {
+    if (page.is_root() || !b.ReadU16LE(0, &prefix) || prefix > page.nodes()[0].size) return false;
+    cursor = 2;
+  }
+  if (!b.ReadU16LE(cursor, &suffix) || !b.Has(cursor + 2, suffix)) return false;
+  scratch->key.assign(page.nodes()[0].bytes.data(), page.nodes()[0].bytes.data() + prefix);
+  scratch->key.insert(scratch->key.end(), b.data() + cursor + 2, b.data() + cursor + 2 + suffix);
+  return true;
+}
+
+// The first tag for which `before(key of tag)` is false, by binary search
+// over tags 1..N-1; nothing when a probed node cannot be decoded (the caller
+// then scans the page in order).
+template <typename Before>
+std::optional<size_t> PartitionTags(const Page& page, Before before) {
+  size_t low = 1, high = page.nodes().size();
+  RecordRef scratch;
+  while (low < high) {
+    const size_t mid = low + (high - low) / 2;
+    if (!NodeKeyAt(page, mid, &scratch)) return std::nullopt;
+    if (before(ByteView(scratch.key))) {
+      low = mid + 1;
+    } else {
+      high = mid;
+    }
+  }
+  return low;
+}
+
+}  // namespace
 
 bool TreeCursor::Seek(uint32_t root_page, ByteView key) {
   valid_ = false;
@@ -55,6 +100,11 @@ bool TreeCursor::Descend(uint32_t page_number, ByteView key, int depth) {
     // The first node at or after the key, else the last node (Seek then
     // steps along the chain).
     const auto& nodes = page_->nodes();
+    std::optional<size_t> first = PartitionTags(
+        *page_, [&](ByteView node_key) { return CompareKeys(node_key, key) < 0; });
+    if (first && nodes.size() > 1) {
+      return SettleFrom(*first < nodes.size() ? *first : nodes.size() - 1);
+    }
     size_t last_ok = 0;
     RecordRef ref;  // reused: keeps its key buffer
     for (size_t tag = 1; tag < nodes.size(); ++tag) {
@@ -66,8 +116,11 @@ bool TreeCursor::Descend(uint32_t page_number, ByteView key, int depth) {
     return SettleFrom(nodes.size());
   }
   const auto& nodes = page.nodes();
+  // Children before the first separator the key belongs under cannot hold it.
+  std::optional<size_t> first =
+      PartitionTags(page, [&](ByteView separator) { return !BelongsUnder(key, separator); });
   RecordRef ref;  // reused: keeps its key buffer
-  for (size_t tag = 1; tag < nodes.size(); ++tag) {
+  for (size_t tag = first.value_or(1); tag < nodes.size(); ++tag) {
     NodeDecode d = DecodeNode(page, uint16_t(tag), &ref);
     if (d == NodeDecode::kDeleted) continue;
     if (d != NodeDecode::kOk) {

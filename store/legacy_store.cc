@@ -16,6 +16,7 @@ constexpr size_t kMessageKeySize = 8;
 constexpr uint8_t kKeyPrefixByte = 0x7F;
 constexpr uint8_t kKeySegmentLength = 0x08;
 inline constexpr char kMessageKeyColumn[] = "N67b0";
+inline constexpr char kMessageClassColumn[] = "S1a";
 
 // The first 8 bytes of a key column, little-endian; nothing when shorter.
 std::optional<uint64_t> KeyOf(const RowValue& v) {
@@ -295,9 +296,8 @@ std::optional<ItemRecords> LegacyStore::OpenMessage(uint64_t message_key, Decode
   std::vector<RowValue> values = reader.Read(columns);
   ItemRecords records;
   for (const RowValue& v : values) {
-    const std::string& name = v.column->name;
-    if (std::find(ListColumns().begin(), ListColumns().end(), name) == ListColumns().end()) continue;
-    decoder_.Decode(DecodePurpose::kMessageListRow, name, v.engine_type, v.code_page,
+    if (v.column->name != kMessageClassColumn) continue;
+    decoder_.Decode(DecodePurpose::kMessageListRow, v.column->name, v.engine_type, v.code_page,
                     ByteView(v.bytes), &records);
   }
   *purpose = PurposeForClass(records.summary.message_class);

@@ -28,16 +28,13 @@ int ColumnSlot(const engine::TableDef& table, const std::string& name) {
 bool RowValueReader::Resolve(ByteView stored, uint8_t flags, Bytes* out, bool* damaged,
                              uint32_t* code_page, uint64_t max_long_value) const {
   if (flags & engine::kTaggedSeparated) {
-    engine::LongValue lv;
-    if (lv_root_ == 0 || long_values_.Read(lv_root_, stored, &lv) != 0) {
+    engine::LongValueReader::WholeValue whole;
+    if (lv_root_ == 0 || long_values_.ReadValue(lv_root_, stored, &whole, max_long_value) != 0) {
       *damaged = true;
       return false;
     }
-    if (lv.total_size > max_long_value) {
-      *damaged = true;
-      return true;
-    }
-    if (!long_values_.ReadAll(lv, out).ok() || lv.truncated) *damaged = true;
+    if (whole.truncated || whole.damaged) *damaged = true;
+    *out = std::move(whole.bytes);
     return true;
   }
   if (flags & engine::kTaggedCompressed) {
