@@ -4,6 +4,7 @@
 #include <string>
 
 #include "cli/dump_command.h"
+#include "cli/export_command.h"
 #include "cli/info_command.h"
 #include "cli/store_commands.h"
 #include "cli/tables_command.h"
@@ -84,6 +85,19 @@ int RunStore(const tarnwell::cli::ScanOptions& o, const std::string& command,
   return 0;
 }
 
+int RunExportCommand(const tarnwell::cli::ExportCommandOptions& o) {
+  tarnwell::cli::TerminalProgress progress;
+  tarnwell::cli::ExportSummary summary;
+  tarnwell::Status s = tarnwell::cli::RunExport(o, progress, &summary);
+  if (!s.ok()) return Fail(o.scan.db, s);
+  std::printf("Exported %llu of %llu items from %zu folders to %s\n",
+              static_cast<unsigned long long>(summary.saved),
+              static_cast<unsigned long long>(summary.found), summary.folders,
+              summary.destination.c_str());
+  if (!summary.log_path.empty()) std::printf("Log: %s\n", summary.log_path.c_str());
+  return 0;
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
@@ -126,7 +140,23 @@ int main(int argc, char** argv) {
   show->add_option("--item", show_item, "item number in the folder's list, from 1")->required();
   show->add_flag("--json", show_json, "print JSON");
 
+  tarnwell::cli::ExportCommandOptions export_options;
+  CLI::App* exp = app.add_subcommand("export", "Export folders to EML files or MBOX mailboxes");
+  AddScanOptions(exp, &export_options.scan);
+  exp->add_option("--to", export_options.to, "eml or mbox")->required();
+  exp->add_option("--out", export_options.out, "destination folder")->required();
+  exp->add_option("--folder", export_options.folders, "folder reference (repeatable; default: all)");
+  exp->add_flag("--hierarchy", export_options.hierarchy, "recreate the folder tree below the destination");
+  exp->add_option("--name-by", export_options.name_by, "file name parts: to,from,subject,date");
+  exp->add_option("--date-range", export_options.date_ranges, "START..END, as 2021-01-31..2021-12-31 (repeatable)");
+  exp->add_flag("--exclude-ranges", export_options.exclude_ranges, "export the items outside the ranges");
+  exp->add_option("--dedup", export_options.dedup, "remove duplicates by: to,from,subject,created,modified,arrival");
+  exp->add_flag("--keep-native", export_options.keep_native, "contacts as .vcf and appointments as .ics");
+  exp->add_option("--ansi-codepage", export_options.ansi_code_page, "header texts in this Windows code page instead of UTF-8");
+  exp->add_option("--log-dir", export_options.log_dir, "folder of the export log (default: the desktop)");
+
   CLI11_PARSE(app, argc, argv);
+  if (exp->parsed()) return RunExportCommand(export_options);
   if (scan->parsed()) return RunStore(scan_options, "scan", "", 0, scan_json);
   if (list->parsed()) return RunStore(list_options, "list", list_ref, 0, list_json);
   if (show->parsed()) return RunStore(show_options, "show", show_ref, show_item, show_json);

@@ -34,6 +34,7 @@ class CollectingTree : public store::FolderTreeSink {
     f.ref = fmt::format("{:x}", (*folders_)[folder_index].folder_id);
     f.path = paths_[parent];
     f.path.push_back(text);
+    f.parent = int(parent) - 1;  // handles are positions + 1; the top item is 0
     const int64_t handle = int64_t(out_->size()) + 1;
     paths_[handle] = f.path;
     out_->push_back(std::move(f));

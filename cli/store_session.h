@@ -28,6 +28,7 @@ struct ShownFolder {
   std::vector<std::string> path;  // names from the source's top item down
   uint32_t index = 0;             // in the store's folder list
   int icon = 0;
+  int parent = -1;                // position of the parent in the shown list; -1: the top item
 };
 
 // Parses "auto", "5.5", "2000", ... into a version code; auto reads the

@@ -76,8 +76,7 @@ std::string QuotedPrintable(std::string_view bytes, size_t first_line_used) {
     if (b == '\r' && i + 1 < bytes.size() && bytes[i + 1] == '\n') {
       tokens.emplace_back(kQpLineBreak);
       ++i;
-    } else if ((b >= kFirstQpLiteral && b <= kLastQpLiteral && b != '=') || b == ' ' ||
-               b == '\t') {
+    } else if ((b >= kFirstQpLiteral && b <= kLastQpLiteral && b != '=') || b == ' ' || b == '\t') {
       tokens.emplace_back(1, char(b));
     } else {
       tokens.push_back(QpEscaped(b));
@@ -136,25 +135,50 @@ std::string ContentWriter::Encode(std::string_view text) const {
 }
 
 void ContentWriter::Property(std::string_view name, std::string_view value) {
+  // Each character in output bytes, so that folds fall between characters.
+  const std::string line = std::string(name).append(":").append(value);
+  std::vector<std::string> chars;
+  chars.reserve(line.size());
+  for (size_t pos = 0; pos < line.size();) {
+    chars.emplace_back();
+    AppendChar(line, &pos, &chars.back());
+  }
+  auto blank = [&](size_t i) { return chars[i] == " " || chars[i] == "\t"; };
+
+  std::vector<size_t> offsets;  // where each character of the current physical line starts
+  size_t first = 0;             // index of the current physical line's first character
   size_t used = 0;
-  std::string piece;
-  auto append = [&](std::string_view text) {
-    size_t pos = 0;
-    while (pos < text.size()) {
-      piece.clear();
-      AppendChar(text, &pos, &piece);
-      if (used + piece.size() > kMaxLineOctets && used > 0) {
-        out_ += kCrLf;
-        out_.push_back(' ');
-        used = 1;
+  for (size_t i = 0; i < chars.size(); ++i) {
+    if (used + chars[i].size() > kMaxLineOctets && used > 0) {
+      // Many readers take a line of nothing but white space for an empty line, which ends a
+      // property; a continuation holds at least one other character where that can be had.
+      bool only_blanks = true;
+      size_t room = kMaxLineOctets - 1;
+      for (size_t k = i; k < chars.size() && chars[k].size() <= room; ++k) {
+        if (!blank(k)) {
+          only_blanks = false;
+          break;
+        }
+        room -= chars[k].size();
       }
-      out_ += piece;
-      used += piece.size();
+      if (only_blanks) {
+        size_t j = i;
+        while (j > first + 1 && blank(j - 1)) --j;
+        if (j > first + 1) {
+          out_.resize(offsets[j - 1 - first]);
+          i = j - 1;
+        }
+      }
+      out_ += kCrLf;
+      out_.push_back(' ');
+      used = 1;
+      first = i;
+      offsets.clear();
     }
-  };
-  append(name);
-  append(":");
-  append(value);
+    offsets.push_back(out_.size());
+    out_ += chars[i];
+    used += chars[i].size();
+  }
   out_ += kCrLf;
 }
 

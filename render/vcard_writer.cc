@@ -71,11 +71,29 @@ const ColumnField kColumnFields[] = {
 const Columns kEmailColumns[] = {{"S8083"}, {"S8093"}, {"S80a3"}};
 
 const AddressColumns kAddressColumns[] = {
-    {&VCardContact::home, {"S3a5e"}, {"S3a5d"}, {"S3a59"}, {"S3a5c"}, {"S3a5b"}, {"S3a5a"},
+    {&VCardContact::home,
+     {"S3a5e"},
+     {"S3a5d"},
+     {"S3a59"},
+     {"S3a5c"},
+     {"S3a5b"},
+     {"S3a5a"},
      {"S801a"}},
-    {&VCardContact::business, {"S804a", "S3a2b"}, {"S8045", "S3a29"}, {"S8046", "S3a27"},
-     {"S8047", "S3a28"}, {"S8048", "S3a2a"}, {"S8049", "S3a26"}, {"S801b"}},
-    {&VCardContact::other, {"S3a64"}, {"S3a63"}, {"S3a5f"}, {"S3a62"}, {"S3a61"}, {"S3a60"},
+    {&VCardContact::business,
+     {"S804a", "S3a2b"},
+     {"S8045", "S3a29"},
+     {"S8046", "S3a27"},
+     {"S8047", "S3a28"},
+     {"S8048", "S3a2a"},
+     {"S8049", "S3a26"},
+     {"S801b"}},
+    {&VCardContact::other,
+     {"S3a64"},
+     {"S3a63"},
+     {"S3a5f"},
+     {"S3a62"},
+     {"S3a61"},
+     {"S3a60"},
      {"S801c"}},
 };
 
@@ -203,7 +221,10 @@ class VCardComposer {
     writer_.Property("VERSION", "2.1");
     Names(c);
     if (!c.company.empty() || !c.department.empty()) {
-      writer_.Property(Name("ORG", true), Structured({c.company, c.department}));
+      // An empty unit after the name is left out rather than written as a trailing ';'.
+      writer_.Property(Name("ORG", true), c.department.empty()
+                                              ? Structured({c.company})
+                                              : Structured({c.company, c.department}));
     }
     Text("NICKNAME", c.nickname, true);
     for (const std::string& email : c.email) Text("EMAIL", email, true);
@@ -243,10 +264,9 @@ class VCardComposer {
         if (ch == ',') ch = ';';
       }
     }
-    writer_.Property(Name("N", true), Structured({surname, c.given_name, c.middle_name,
-                                                  c.prefix, c.suffix}));
-    std::string full =
-        JoinNonEmpty({c.prefix, c.given_name, c.middle_name, c.surname, c.suffix});
+    writer_.Property(Name("N", true),
+                     Structured({surname, c.given_name, c.middle_name, c.prefix, c.suffix}));
+    std::string full = JoinNonEmpty({c.prefix, c.given_name, c.middle_name, c.surname, c.suffix});
     for (const std::string* fallback : {&c.company, &c.nickname, &c.email[0]}) {
       if (full.empty()) full = *fallback;
     }
@@ -257,8 +277,8 @@ class VCardComposer {
     const std::string base = std::string("TYPE=").append(type);
     if (HasParts(a)) {
       writer_.Property(Name("ADR;" + base, true),
-                       Structured({a.po_box, "", OneLine(a.street), a.city, a.region,
-                                   a.postal_code, a.country}));
+                       Structured({a.po_box, "", OneLine(a.street), a.city, a.region, a.postal_code,
+                                   a.country}));
     }
     if (!a.label.empty()) {
       writer_.QuotedPrintableProperty(

@@ -52,13 +52,13 @@ struct VCardContact {
   std::string email[3];
   VCardAddress home, business, other;
   std::string business_fax, business_phone, business_phone_2, car_phone, home_fax, home_phone,
-      home_phone_2, isdn, mobile_phone, other_phone, pager, primary_fax, primary_phone,
-      radio_phone, telex, tty_tdd_phone, callback_phone, company_main_phone, assistant_phone;
+      home_phone_2, isdn, mobile_phone, other_phone, pager, primary_fax, primary_phone, radio_phone,
+      telex, tty_tdd_phone, callback_phone, company_main_phone, assistant_phone;
   std::string job_title, profession, business_home_page, assistant, manager, spouse;
   store::FileTime birthday, anniversary;
   std::string free_busy_url, im_address;
-  std::string note;                // the item's plain-text body
-  std::optional<Bytes> picture;    // image data
+  std::string note;              // the item's plain-text body
+  std::optional<Bytes> picture;  // image data
 };
 
 // The fields of a decoded contact, taken from its string columns (the standard MAPI contact

@@ -55,8 +55,8 @@ uint64_t CMimeCodeBase::GetEncodeLength() const {
 uint64_t CMimeCodeBase::GetDecodeLength() const { return input_.size(); }
 
 bool CMimeCodeBase::EncodeTo(MimeSink* sink) const {
-  if (mode_ != kModeText) return sink->Write(reinterpret_cast<const char*>(input_.data()),
-                                             input_.size());
+  if (mode_ != kModeText)
+    return sink->Write(reinterpret_cast<const char*>(input_.data()), input_.size());
   StagingBuffer out(sink);
   const size_t n = input_.size();
   for (size_t i = 0; i < n; ++i) {

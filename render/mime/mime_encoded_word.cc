@@ -14,20 +14,17 @@ struct CharsetName {
 
 // Names as mail programs write them. Several names may map to one code page when reading.
 constexpr CharsetName kCharsetNames[] = {
-    {65001, "utf-8"},        {65001, "utf8"},         {20127, "us-ascii"},
-    {20127, "ascii"},        {1250, "windows-1250"},  {1251, "windows-1251"},
-    {1252, "windows-1252"},  {1253, "windows-1253"},  {1254, "windows-1254"},
-    {1255, "windows-1255"},  {1256, "windows-1256"},  {1257, "windows-1257"},
-    {1258, "windows-1258"},  {874, "windows-874"},    {874, "tis-620"},
-    {932, "shift_jis"},      {932, "shift-jis"},      {932, "sjis"},
-    {932, "windows-31j"},    {936, "gb2312"},         {936, "gbk"},
-    {949, "ks_c_5601-1987"}, {949, "cp949"},          {950, "big5"},
-    {20866, "koi8-r"},       {21866, "koi8-u"},       {28591, "iso-8859-1"},
-    {28591, "latin1"},       {28592, "iso-8859-2"},   {28593, "iso-8859-3"},
-    {28594, "iso-8859-4"},   {28595, "iso-8859-5"},   {28596, "iso-8859-6"},
-    {28597, "iso-8859-7"},   {28598, "iso-8859-8"},   {28599, "iso-8859-9"},
-    {28603, "iso-8859-13"},  {28605, "iso-8859-15"},  {50220, "iso-2022-jp"},
-    {51932, "euc-jp"},       {51949, "euc-kr"},       {54936, "gb18030"},
+    {65001, "utf-8"},       {65001, "utf8"},         {20127, "us-ascii"},    {20127, "ascii"},
+    {1250, "windows-1250"}, {1251, "windows-1251"},  {1252, "windows-1252"}, {1253, "windows-1253"},
+    {1254, "windows-1254"}, {1255, "windows-1255"},  {1256, "windows-1256"}, {1257, "windows-1257"},
+    {1258, "windows-1258"}, {874, "windows-874"},    {874, "tis-620"},       {932, "shift_jis"},
+    {932, "shift-jis"},     {932, "sjis"},           {932, "windows-31j"},   {936, "gb2312"},
+    {936, "gbk"},           {949, "ks_c_5601-1987"}, {949, "cp949"},         {950, "big5"},
+    {20866, "koi8-r"},      {21866, "koi8-u"},       {28591, "iso-8859-1"},  {28591, "latin1"},
+    {28592, "iso-8859-2"},  {28593, "iso-8859-3"},   {28594, "iso-8859-4"},  {28595, "iso-8859-5"},
+    {28596, "iso-8859-6"},  {28597, "iso-8859-7"},   {28598, "iso-8859-8"},  {28599, "iso-8859-9"},
+    {28603, "iso-8859-13"}, {28605, "iso-8859-15"},  {50220, "iso-2022-jp"}, {51932, "euc-jp"},
+    {51949, "euc-kr"},      {54936, "gb18030"},
 };
 
 constexpr std::string_view kWordStart = "=?";
@@ -40,8 +37,8 @@ constexpr size_t kBase64GroupChars = 4;
 constexpr size_t kQEscapeWidth = 3;
 
 bool IsQLiteral(uint8_t c) {
-  return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') ||
-         c == '!' || c == '*' || c == '+' || c == '-' || c == '/';
+  return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '!' ||
+         c == '*' || c == '+' || c == '-' || c == '/';
 }
 
 bool IsBlank(char c) { return c == ' ' || c == '\t' || c == '\r' || c == '\n'; }
@@ -158,8 +155,8 @@ std::vector<std::string> EncodeWords(std::string_view text, std::string_view cha
   const CharsetText converted = ConvertForWords(text, codepage);
   const std::string& bytes = converted.bytes;
   if (letter != 'B' && letter != 'Q') {
-    letter = ChooseWordEncoding(
-        ByteView(reinterpret_cast<const uint8_t*>(bytes.data()), bytes.size()));
+    letter =
+        ChooseWordEncoding(ByteView(reinterpret_cast<const uint8_t*>(bytes.data()), bytes.size()));
   }
   const size_t overhead = kWordFixedOverhead + charset.size();
   const size_t chars = converted.starts.size() - 1;
@@ -241,9 +238,10 @@ bool DecodeEncodedWord(std::string_view word, std::string* utf8) {
       const char c = payload[i];
       if (c == '_') {
         bytes.push_back(' ');
-      } else if (c == '=' && i + 2 < payload.size() + 0 && HexValue(payload[i + 1]) >= 0 &&
+      } else if (c == '=' && i + 2 < payload.size() && HexValue(payload[i + 1]) >= 0 &&
                  HexValue(payload[i + 2]) >= 0) {
-        bytes.push_back(static_cast<char>(HexValue(payload[i + 1]) * 16 + HexValue(payload[i + 2])));
+        bytes.push_back(
+            static_cast<char>(HexValue(payload[i + 1]) * 16 + HexValue(payload[i + 2])));
         i += 2;
       } else {
         bytes.push_back(c);
@@ -254,7 +252,22 @@ bool DecodeEncodedWord(std::string_view word, std::string* utf8) {
   return true;
 }
 
+std::string FirstEncodedWordCharset(std::string_view text) {
+  for (size_t pos = text.find(kWordStart); pos != std::string_view::npos;
+       pos = text.find(kWordStart, pos + 1)) {
+    if (MatchEncodedWord(text, pos) == 0) continue;
+    const size_t start = pos + kWordStart.size();
+    std::string_view charset = text.substr(start, text.find(kWordSeparator, start) - start);
+    return std::string(charset.substr(0, charset.find('*')));
+  }
+  return {};
+}
+
 std::string HeaderBytesToUtf8(std::string_view text) { return BytesToUtf8(text, 0); }
+
+std::string CharsetBytesToUtf8(std::string_view bytes, std::string_view charset) {
+  return BytesToUtf8(bytes, CodePageForCharset(charset));
+}
 
 std::string DecodeEncodedWords(std::string_view text) {
   std::string out;

@@ -49,6 +49,11 @@ size_t MatchEncodedWord(std::string_view text, size_t pos);
 // dropped, as RFC 2047 says. Text outside words is taken as UTF-8 when it is valid, else as
 // windows-1252.
 std::string DecodeEncodedWords(std::string_view text);
+// The charset named by the first encoded word in `text`, or "" when there is none.
+std::string FirstEncodedWordCharset(std::string_view text);
+// Bytes in a named charset to UTF-8; an unknown charset is read as UTF-8 when the bytes are
+// valid UTF-8, else as windows-1252.
+std::string CharsetBytesToUtf8(std::string_view bytes, std::string_view charset);
 // Raw 8-bit header text to UTF-8 by the same rule.
 std::string HeaderBytesToUtf8(std::string_view text);
 

@@ -50,7 +50,7 @@ bool FileSink::DoWrite(const char* data, size_t size) {
 }
 
 bool StagingBuffer::Flush() {
-  bool ok = sink_->Write(data_, used_);
+  bool ok = sink_->Write(data_.get(), used_);
   used_ = 0;
   return ok;
 }

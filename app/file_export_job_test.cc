@@ -1,0 +1,246 @@
+#include "app/file_export_job.h"
+
+#include <gtest/gtest.h>
+
+#include <filesystem>
+#include <fstream>
+#include <map>
+
+#include "app/scan_driver.h"
+#include "base/paths.h"
+#include "base/text.h"
+#include "render/eml_composer.h"
+#include "render/mime/mime_sink.h"
+#include "testing/exchange/store_builder.h"
+
+namespace tarnwell::app {
+namespace {
+
+namespace fs = std::filesystem;
+namespace fx = forge::exchange;
+
+const std::string kChecker = std::string(TARNWELL_SOURCE_DIR) + "/app/testdata/check_export.py";
+
+bool HavePython() { return std::system("/usr/bin/python3 -c 'import email' 2>/dev/null") == 0; }
+
+// Runs the independent check; its report goes into the failure message.
+void CheckExport(const std::string& manifest, const std::string& dir, const std::string& mode) {
+  const std::string report = dir + ".report";
+  const std::string cmd = "/usr/bin/python3 '" + kChecker + "' '" + manifest + "' '" + dir +
+                          "' " + mode + " > '" + report + "' 2>&1";
+  const int rc = std::system(cmd.c_str());
+  std::ifstream in(report);
+  const std::string text((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
+  EXPECT_EQ(rc, 0) << text;
+}
+
+class Collector : public store::FolderTreeSink {
+ public:
+  int64_t AddTopItem(const std::string& text, int, uint64_t) override {
+    paths_[0] = {text};
+    return 0;
+  }
+  int64_t AddFolder(int64_t parent, const std::string& text, int, uint32_t index) override {
+    ExportFolder f{index, paths_[parent]};
+    f.path.push_back(text);
+    paths_[int64_t(folders.size()) + 1] = f.path;
+    folders.push_back(f);
+    return int64_t(folders.size());
+  }
+  std::vector<ExportFolder> folders;
+
+ private:
+  std::map<int64_t, std::vector<std::string>> paths_;
+};
+
+struct StoreCase {
+  const char* name;
+  int version;
+  bool public_store;
+};
+
+class FileExportTest : public ::testing::TestWithParam<StoreCase> {
+ protected:
+  void SetUp() override {
+    if (!HavePython()) GTEST_SKIP() << "/usr/bin/python3 is needed to read the export back";
+    ASSERT_TRUE(MakeTempDir("tarnwell-export", &dir_).ok());
+    fx::LegacyStoreOptions o;
+    o.version = GetParam().version;
+    o.public_store = GetParam().public_store;
+    o.damage = fx::DamageOptions::All();
+    fx::StoreManifest manifest;
+    ASSERT_TRUE(fx::BuildLegacyStore(o, dir_ + "/store.edb", &manifest).ok());
+    manifest_path_ = dir_ + "/manifest.json";
+    std::ofstream(manifest_path_) << fx::ManifestJson(manifest);
+
+    RunSettings settings;
+    settings.edb_path = dir_ + "/store.edb";
+    settings.temp_root = dir_ + "/temp";
+    settings.version_code = GetParam().version;
+    ASSERT_TRUE(OpenSource(settings, 1, NullProgress(), &source_).ok());
+    RunningFlag running{true};
+    ASSERT_TRUE(RunScan(source_, 1, running, NullProgress(), tree_).tree_shown);
+  }
+  void TearDown() override {
+    source_.store.reset();
+    source_.reader.reset();
+    if (!dir_.empty()) fs::remove_all(dir_);
+  }
+
+  FileExportResult Export(OutputFormat format, bool keep_native, const std::string& out) {
+    FileExportRequest r;
+    r.options.format = format;
+    r.options.keep_hierarchy = true;
+    r.options.destination = dir_ + "/" + out;
+    r.folders = tree_.folders;
+    r.source_path = dir_ + "/store.edb";
+    r.keep_native = keep_native;
+    r.log_dir = dir_;
+    RunningFlag running{true};
+    FileExportResult result;
+    EXPECT_TRUE(RunFileExport(*source_.store, r, running, NullProgress(), &result).ok());
+    return result;
+  }
+
+  std::string dir_, manifest_path_;
+  SourceEntry source_;
+  Collector tree_;
+};
+
+TEST_P(FileExportTest, EmlMboxAndNativeFilesReadBackAsTheManifestSays) {
+  Export(OutputFormat::kEml, false, "eml");
+  CheckExport(manifest_path_, dir_ + "/eml", "eml");
+  Export(OutputFormat::kMbox, false, "mbox");
+  CheckExport(manifest_path_, dir_ + "/mbox", "mbox");
+  const FileExportResult native = Export(OutputFormat::kEml, true, "native");
+  CheckExport(manifest_path_, dir_ + "/native", "native");
+  // Every folder logged what it found and saved.
+  std::ifstream log(native.log_path, std::ios::binary);
+  const std::string raw((std::istreambuf_iterator<char>(log)), std::istreambuf_iterator<char>());
+  const std::string text = Utf16LEToUtf8(ByteView(reinterpret_cast<const uint8_t*>(raw.data()) + 2,
+                                                  raw.size() - 2));
+  EXPECT_NE(text.find("Save Items as:\tEML\t\r\n"), std::string::npos);
+  EXPECT_NE(text.find("Items Found: "), std::string::npos);
+  EXPECT_NE(text.find("Save Process Completed Successfully"), std::string::npos);
+}
+
+INSTANTIATE_TEST_SUITE_P(Stores, FileExportTest,
+                         ::testing::Values(StoreCase{"v55", 4, false}, StoreCase{"v2003", 1, false},
+                                           StoreCase{"v2007", 2, false},
+                                           StoreCase{"v2003_public", 1, true}),
+                         [](const auto& info) { return std::string(info.param.name); });
+
+TEST(ItemFileNameTest, ForbiddenCharactersCounterAndCuts) {
+  store::MessageSummary row;
+  row.to = "A<b>";
+  row.sender = "x|y";
+  row.subject = "a/b:c";
+  const bool all[4] = {true, true, true, false};
+  EXPECT_EQ(ItemFileName(row, "", all, 7, ".eml", 10), "A b x ya b c7.eml");
+  const bool none[4] = {false, false, false, false};
+  EXPECT_EQ(ItemFileName(row, "", none, 3, ".eml", 10), "3.eml");
+  // Hostile subjects never leave the folder or hide the file.
+  row.subject = "../../etc/passwd\r\n";
+  const bool subject[4] = {false, false, true, false};
+  const std::string hostile = ItemFileName(row, "", subject, 1, ".eml", 10);
+  EXPECT_EQ(hostile.find('/'), std::string::npos);
+  EXPECT_NE(hostile.front(), '.');
+  EXPECT_EQ(hostile.find('\n'), std::string::npos);
+  // A deep folder shortens the name; counter and extension survive.
+  row.subject = std::string(300, 'S');
+  const std::string cut = ItemFileName(row, "", subject, 12, ".eml", 200);
+  EXPECT_LT(cut.size() + 200, 256u);
+  EXPECT_EQ(cut.substr(cut.size() - 6), "12.eml");
+  // Multi-byte text is cut on a character and fits a file-system name.
+  row.subject = std::string();
+  for (int i = 0; i < 200; ++i) row.subject += "\xE6\x97\xA5";  // 日
+  const std::string wide = ItemFileName(row, "", subject, 5, ".eml", 0);
+  EXPECT_LE(wide.size(), 255u);
+  EXPECT_TRUE(IsValidUtf8(wide));
+  EXPECT_EQ(wide.substr(wide.size() - 5), "5.eml");
+}
+
+TEST(DuplicateDigestTest, ChosenFieldsDecide) {
+  store::MessageSummary a, b;
+  a.to = b.to = "x";
+  a.subject = "one";
+  b.subject = "two";
+  a.created = b.created = "01/01/2020 00:00:00";
+  const bool by_to_created[6] = {true, false, false, true, false, false};
+  const bool by_subject[6] = {false, false, true, false, false, false};
+  EXPECT_EQ(DuplicateDigest(a, by_to_created), DuplicateDigest(b, by_to_created));
+  EXPECT_NE(DuplicateDigest(a, by_subject), DuplicateDigest(b, by_subject));
+  // A To line of a single space counts as empty.
+  store::MessageSummary c = a, d = a;
+  c.to = " ";
+  d.to = "";
+  EXPECT_EQ(DuplicateDigest(c, by_to_created), DuplicateDigest(d, by_to_created));
+}
+
+TEST(ExportOptionsTest, PagesRefuseWithTheirMessages) {
+  ExportOptions o;
+  o.dedup_on = true;
+  for (bool& b : o.dedup_by) b = false;
+  EXPECT_EQ(CheckFilterPage(o).message(), kNoDedupCriteria);
+  o.dedup_on = false;
+  o.date_mode = DateMode::kInside;
+  EXPECT_EQ(CheckFilterPage(o).message(), kNoDateRange);
+  EXPECT_EQ(AddDateRange(&o.date_ranges, {{2021, 5, 1}, {2021, 4, 1}}).message(), kEndBeforeStart);
+  ASSERT_TRUE(AddDateRange(&o.date_ranges, {{2021, 1, 1}, {2021, 6, 30}}).ok());
+  ASSERT_TRUE(AddDateRange(&o.date_ranges, {{2021, 1, 1}, {2021, 6, 30}}).ok());
+  EXPECT_EQ(o.date_ranges.size(), 1u);
+  EXPECT_TRUE(CheckFilterPage(o).ok());
+  EXPECT_EQ(CheckPstPage(&o, true, "/x", true, "99", false).message(), kSplitTooSmall);
+  EXPECT_TRUE(CheckPstPage(&o, true, "/x", true, "1", true).ok());
+  EXPECT_EQ(o.split_size, uint64_t(1) << 30);
+  EXPECT_EQ(CheckPstPage(&o, true, "/x", true, "", false).message(), kNoSplitSize);
+  EXPECT_EQ(CheckPstPage(&o, false, "", false, "", false).message(), kNoExistingPst);
+  for (bool& b : o.name_by) b = false;
+  EXPECT_EQ(CheckFormatPage(&o, "/out", 0).message(), kNoNamingOption);
+  o.name_by[2] = true;
+  EXPECT_EQ(CheckFormatPage(&o, "", 0).message(), kNoDestination);
+  // Field by field: June 15 lies in Jan 1 - Jun 30; Feb 20 not in Jan 15 - Mar 10.
+  EXPECT_TRUE(InRange({2021, 6, 15}, {{2021, 1, 1}, {2021, 6, 30}}));
+  EXPECT_FALSE(InRange({2021, 2, 20}, {{2021, 1, 15}, {2021, 3, 10}}));
+}
+
+TEST(EmlComposerTest, LargeAttachmentsGoOutWhole) {
+  if (!HavePython()) GTEST_SKIP() << "/usr/bin/python3 is needed";
+  std::string dir;
+  ASSERT_TRUE(MakeTempDir("tarnwell-big", &dir).ok());
+  constexpr size_t kSize = 41u << 20;
+  std::vector<store::AttachmentRecord> attachments(1);
+  attachments[0].name = "big.bin";
+  attachments[0].data.resize(kSize);
+  for (size_t i = 0; i < kSize; ++i) attachments[0].data[i] = uint8_t(i * 2654435761u >> 24);
+  store::MessageRecord message;
+  const std::string text = "Body\r\nFrom here on\r\n";
+  message.body.assign(text.begin(), text.end());
+  message.body_is_text = true;
+  render::HeaderStrings headers;
+  headers.subject = "Line one\r\nBcc: injected@example.com";
+  const std::string path = dir + "/big.eml";
+  FILE* f = std::fopen(path.c_str(), "wb");
+  ASSERT_NE(f, nullptr);
+  render::FileSink sink(f);
+  ASSERT_TRUE(render::ComposeMessage(message, std::nullopt, attachments, headers, {}, &sink).ok());
+  std::fclose(f);
+  const std::string script =
+      "import email, email.policy, hashlib, sys\n"
+      "m = email.message_from_binary_file(open(sys.argv[1], 'rb'), policy=email.policy.default)\n"
+      "assert m['bcc'] is None, 'header injected'\n"
+      "a = list(m.iter_attachments())\n"
+      "d = a[0].get_payload(decode=True)\n"
+      "print(len(d), hashlib.sha256(d).hexdigest())\n";
+  std::ofstream(dir + "/read.py") << script;
+  const std::string cmd = "/usr/bin/python3 " + dir + "/read.py " + path + " > " + dir + "/out.txt";
+  ASSERT_EQ(std::system(cmd.c_str()), 0);
+  std::ifstream in(dir + "/out.txt");
+  size_t size = 0;
+  in >> size;
+  EXPECT_EQ(size, kSize);
+  fs::remove_all(dir);
+}
+
+}  // namespace
+}  // namespace tarnwell::app
