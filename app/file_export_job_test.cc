@@ -124,6 +124,73 @@ TEST_P(FileExportTest, EmlMboxAndNativeFilesReadBackAsTheManifestSays) {
   EXPECT_NE(text.find("Save Process Completed Successfully"), std::string::npos);
 }
 
+// Lowers the running flag when the n-th item starts saving.
+class StopAfter : public ProgressSink {
+ public:
+  StopAfter(RunningFlag* running, int items) : running_(running), left_(items) {}
+  void Stage(const std::string& text) override {
+    if (text.size() > 10 && text.compare(text.size() - 10, 10, " is saving") == 0 && --left_ == 0) {
+      running_->store(false);
+    }
+  }
+
+ private:
+  RunningFlag* running_;
+  int left_;
+};
+
+TEST_P(FileExportTest, DateFilterAndStop) {
+  auto run = [&](DateMode mode, const std::string& out, ProgressSink& progress,
+                 RunningFlag& running) {
+    FileExportRequest r;
+    r.options.format = OutputFormat::kEml;
+    r.options.date_mode = mode;
+    r.options.date_ranges = {{{1990, 1, 1}, {1991, 12, 31}}};
+    r.options.destination = dir_ + "/" + out;
+    r.folders = tree_.folders;
+    r.log_dir = dir_;
+    FileExportResult result;
+    EXPECT_TRUE(RunFileExport(*source_.store, r, running, progress, &result).ok());
+    return result;
+  };
+  auto totals = [](const FileExportResult& r) {
+    uint64_t found = 0, saved = 0;
+    for (const FolderResult& f : r.folders) found += f.found, saved += f.saved;
+    return std::make_pair(found, saved);
+  };
+  RunningFlag running{true};
+  // Nothing lies in 1990-1991: inside the range saves nothing, excluding it
+  // saves what opens.
+  auto [found_in, saved_in] = totals(run(DateMode::kInside, "inside", NullProgress(), running));
+  EXPECT_GT(found_in, 0u);
+  EXPECT_EQ(saved_in, 0u);
+  running.store(true);
+  auto [found_out, saved_out] = totals(run(DateMode::kExclude, "outside", NullProgress(), running));
+  EXPECT_EQ(found_out, found_in);
+  EXPECT_GT(saved_out, 0u);
+  // Stop during the second item: the item in hand is finished, the loop
+  // stops before the next, the folder still ends with its "Items Saved"
+  // line, and nothing half-written is left.
+  running.store(true);
+  StopAfter stopper(&running, 2);
+  FileExportResult stopped = run(DateMode::kAllTime, "stopped", stopper, running);
+  EXPECT_EQ(totals(stopped).second, 2u);
+  EXPECT_TRUE(stopped.stopped);
+  std::ifstream log(stopped.log_path, std::ios::binary);
+  const std::string raw((std::istreambuf_iterator<char>(log)), std::istreambuf_iterator<char>());
+  const std::string text = Utf16LEToUtf8(ByteView(reinterpret_cast<const uint8_t*>(raw.data()) + 2,
+                                                  raw.size() - 2));
+  size_t saved_lines = 0;
+  for (size_t at = text.find("Items Saved: "); at != std::string::npos;
+       at = text.find("Items Saved: ", at + 1)) {
+    ++saved_lines;
+  }
+  EXPECT_EQ(saved_lines, stopped.folders.size());
+  for (const auto& e : fs::recursive_directory_iterator(dir_ + "/stopped")) {
+    EXPECT_NE(e.path().extension(), ".part");
+  }
+}
+
 INSTANTIATE_TEST_SUITE_P(Stores, FileExportTest,
                          ::testing::Values(StoreCase{"v55", 4, false}, StoreCase{"v2003", 1, false},
                                            StoreCase{"v2007", 2, false},
