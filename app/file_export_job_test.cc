@@ -148,7 +148,8 @@ TEST_P(FileExportTest, DateFilterAndStop) {
     r.options.date_ranges = {{{1990, 1, 1}, {1991, 12, 31}}};
     r.options.destination = dir_ + "/" + out;
     r.folders = tree_.folders;
-    r.log_dir = dir_;
+    r.log_dir = dir_ + "/log-" + out;  // runs in one second would share a log
+    fs::create_directories(r.log_dir);
     FileExportResult result;
     EXPECT_TRUE(RunFileExport(*source_.store, r, running, progress, &result).ok());
     return result;
