@@ -555,7 +555,12 @@ const std::vector<PropertyDecoder::Rule>& Rules() {
       "S3a63", "S8008", "S8009", "S800a", "S800e", "S800f", "S8010", "S801a", kThrough, "S801e",
       "S808d", "S8095", "S8097", "S809c", "S809e", "S80a5", "S80a6", "S80a7", "S8106", "S8110",
       kThrough, "S8114", "S811c", kThrough, "S811f", "S813c", kThrough, "S813f", "S8158", "S81af",
-      "S81b0", "S81b4", "S81b5", "S81b9", "S81ba", "S8263", "S8273"}, kContact, kAllVersions,
+      "S81b0", "S81b4", "S81b5", "S81b9", "S81ba", "S8263", "S8273",
+      // Address parts, the web page, post-office boxes, e-mail addresses,
+      // free/busy and IM addresses under the numbers the contact writer
+      // reads them by.
+      "S3a26", kThrough, "S3a2b", "S3a51", "S3a5e", "S3a64", "S802b", "S8045", kThrough, "S804a",
+      "S8062", "S8083", "S8093", "S80a3", "S80d8"}, kContact, kAllVersions,
      [](C c, R r) { return SetListed(c, &r->contact.strings); }},
 
     // Appointment detail. The body text is kept once, outside the list.
