@@ -40,7 +40,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     if (record.empty() && length != 0) break;
   }
   std::vector<TableDef> tables = builder.Finish();
-  if (tables.size() != parsed_tables) std::abort();
+  // Every table comes from a table record; repeats of one key count once.
+  if (tables.size() > parsed_tables) std::abort();
   volatile size_t sink = 0;
   for (const TableDef& t : tables) {
     sink = sink + ListedTableName(t.name(), PageFamily::kLegacy).size() +
