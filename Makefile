@@ -14,11 +14,15 @@ build: setup
 	cmake --build $(BUILD) -j $(JOBS)
 
 # The main job on a bundled sample: an Exchange 2007 mailbox database the
-# test store builder generates at build time, scanned, with its Inbox listed.
+# test store builder generates at build time, scanned, its Inbox listed,
+# and every folder exported to EML files below build/demo-export.
 demo: build
 	$(BUILD)/cli/tarnwell info $(BUILD)/samples/exchange2007.edb
 	$(BUILD)/cli/tarnwell scan $(BUILD)/samples/exchange2007.edb
 	$(BUILD)/cli/tarnwell list $(BUILD)/samples/exchange2007.edb --folder 1000000000a31
+	mkdir -p $(BUILD)/demo-export
+	$(BUILD)/cli/tarnwell export $(BUILD)/samples/exchange2007.edb --to eml --hierarchy \
+	    --out $(BUILD)/demo-export --log-dir $(BUILD)/demo-export
 
 test: build
 	ctest --test-dir $(BUILD) --output-on-failure -j $(JOBS)
