@@ -121,7 +121,9 @@ class LegacyStoreTest : public ::testing::TestWithParam<Case> {
 
 TEST_P(LegacyStoreTest, TreeMatchesTheManifest) {
   EXPECT_EQ(store_->public_store(), manifest_.public_store);
-  if (manifest_.public_store) EXPECT_EQ(tree_.top, "Public Root");
+  if (manifest_.public_store) {
+    EXPECT_EQ(tree_.top, "Public Root");
+  }
   size_t visible = 0;
   for (const fx::ManifestFolder& f : manifest_.folders) {
     std::vector<std::string> path = f.path;
@@ -199,7 +201,9 @@ TEST_P(LegacyStoreTest, ListsAndItemsMatchTheManifest) {
       } else if (purpose == DecodePurpose::kContactDetail) {
         for (const auto& [name, value] : want.strings) {
           auto it = item->contact.strings.find(name);
-          if (it != item->contact.strings.end()) EXPECT_EQ(it->second, value) << name;
+          if (it != item->contact.strings.end()) {
+            EXPECT_EQ(it->second, value) << name;
+          }
         }
       } else if (purpose == DecodePurpose::kAppointmentDetail) {
         for (const char* column : {"T814e", "T8197", "T60", "T81ef"}) {
