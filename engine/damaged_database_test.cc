@@ -73,7 +73,9 @@ class DatabaseFile {
     std::FILE* f = std::fopen(path_.c_str(), "wb");
     EXPECT_NE(f, nullptr);
     if (!f) return;
-    if (!bytes.empty()) EXPECT_EQ(std::fwrite(bytes.data(), 1, bytes.size(), f), bytes.size());
+    if (!bytes.empty()) {
+      EXPECT_EQ(std::fwrite(bytes.data(), 1, bytes.size(), f), bytes.size());
+    }
     std::fclose(f);
   }
   ~DatabaseFile() { std::remove(path_.c_str()); }
