@@ -160,27 +160,7 @@ bool LegacyStore::WalkKeyedTable(const engine::TableDef& table, const std::strin
     }
     return true;
   });
-  std::vector<uint64_t> dropped = map->Finish();
-  locations->Flush();
-  if (!dropped.empty()) {
-    // Repeated keys got no ordinal: keep the file dense, ordinal k at k - 1.
-    LocationFile compact;
-    const std::string tmp = path + ".tmp";
-    if (compact.Create(tmp).ok()) {
-      size_t d = 0;
-      for (uint64_t pos = 1; pos <= locations->count(); ++pos) {
-        if (d < dropped.size() && dropped[d] == pos) {
-          ++d;
-          continue;
-        }
-        if (auto loc = locations->Read(pos)) compact.Append(*loc);
-      }
-      compact.Close();
-      locations->Close();
-      std::filesystem::rename(tmp, path);
-      locations->Open(path);
-    }
-  }
+  CompactLocations(locations, map->Finish());
   return true;
 }
 

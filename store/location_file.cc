@@ -59,4 +59,25 @@ std::optional<RecordLocation> LocationFile::Read(uint64_t ordinal) {
   return RecordLocation{LoadU32LE(entry), LoadU16LE(entry + 4)};
 }
 
+void CompactLocations(LocationFile* file, const std::vector<uint64_t>& dropped) {
+  file->Flush();
+  if (dropped.empty() || !file->is_open()) return;
+  const std::string path = file->path();
+  const std::string tmp = path + ".tmp";
+  LocationFile compact;
+  if (!compact.Create(tmp).ok()) return;
+  size_t d = 0;
+  for (uint64_t pos = 1; pos <= file->count(); ++pos) {
+    if (d < dropped.size() && dropped[d] == pos) {
+      ++d;
+      continue;
+    }
+    if (auto loc = file->Read(pos)) compact.Append(*loc);
+  }
+  compact.Close();
+  file->Close();
+  std::rename(tmp.c_str(), path.c_str());
+  file->Open(path);
+}
+
 }  // namespace tarnwell::store

@@ -12,6 +12,7 @@
 #include <cstdio>
 #include <optional>
 #include <string>
+#include <vector>
 
 #include "base/status.h"
 
@@ -54,6 +55,10 @@ class LocationFile {
   std::string path_;
   uint64_t count_ = 0;
 };
+
+// Drops the entries of `dropped` walk positions (from 1, ascending) from a
+// file written one entry per walk position, so that entry k is ordinal k.
+void CompactLocations(LocationFile* file, const std::vector<uint64_t>& dropped);
 
 }  // namespace tarnwell::store
 

@@ -1,0 +1,362 @@
+#include "store/modern_store.h"
+
+#include <algorithm>
+#include <cstdio>
+#include <filesystem>
+#include <set>
+
+#include "engine/catalog.h"
+#include "store/legacy_store.h"
+#include "store/property_blob.h"
+#include "store/row_values.h"
+
+namespace tarnwell::store {
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr size_t kIdSize = 8;
+constexpr size_t kMinMessageIdSize = 9;  // a MessageId of 8 bytes or less maps nothing
+
+bool Modern2013(int version) { return version == engine::kExchange2013; }
+
+// Column names by generation.
+struct Columns {
+  const char* mailbox_number;
+  const char* mailbox_name;
+  const char* folder_id;
+  const char* parent_id;
+  const char* folder_name;
+  const char* container_class;
+  const char* message_class;
+};
+constexpr Columns k2013 = {"MailboxNumber", "DisplayName", "FolderId", "ParentFolderId",
+                           "DisplayName",   "ContainerClass", "MessageClass"};
+constexpr Columns k2010 = {"Q6764", "S3001", "Q6748", "Q6749", "S3001", "S3613", "S1a"};
+
+const std::vector<std::string>& ListColumns() {
+  static const std::vector<std::string> kColumns = {
+      "DisplayTo", "RecipientList", "MessageId", "DateCreated", "MessageClass", "PropertyBlob",
+      "HasAttachments", "SubjectPrefix", "Importance", "IsRead", "DateReceived",
+      "LastModificationTime", "S678e", "N67b0", "T3007", "S1a", "Be1b", "Le07", "L17", "T3008",
+      "Te06", "Q6748", "S42", "S3d", "Se1d"};
+  return kColumns;
+}
+
+// An id column: the last 8 bytes of the value, little-endian (folder ids are
+// 8 bytes; ids of real servers are longer and end in their counter).
+std::optional<uint64_t> IdOf(const RowValue& v, size_t min_size = kIdSize) {
+  if (v.bytes.size() < min_size || v.bytes.size() < kIdSize) return std::nullopt;
+  return LoadU64LE(v.bytes.data() + v.bytes.size() - kIdSize);
+}
+
+std::optional<uint64_t> ReadId(const RowValueReader& values, const engine::TableDef& table,
+                               const engine::RecordColumns& columns, const char* name,
+                               size_t min_size = kIdSize) {
+  const int slot = ColumnSlot(table, name);
+  RowValue v;
+  if (slot < 0 || !values.ReadOne(columns, size_t(slot), &v)) return std::nullopt;
+  if (v.engine_type != engine::kColumnBinary && v.engine_type != engine::kColumnLongBinary) {
+    // An integer column holds the id itself.
+    uint64_t value = 0;
+    for (size_t i = v.bytes.size(); i-- > 0;) value = (value << 8) | v.bytes[i];
+    return v.bytes.empty() ? std::nullopt : std::optional<uint64_t>(value);
+  }
+  return IdOf(v, min_size);
+}
+
+}  // namespace
+
+std::string ModernFolderTableName(int version, uint64_t number) {
+  if (Modern2013(version)) {
+    return "Folder_" + std::to_string(static_cast<long long>(number));
+  }
+  char hex[24];
+  std::snprintf(hex, sizeof hex, "%llx", static_cast<unsigned long long>(number));
+  const std::string text = hex;
+  const size_t first_run = text.find("0000");
+  std::string first, second;
+  if (first_run == std::string::npos) {
+    second = text.size() > 1 ? text.substr(1) : "";
+  } else {
+    first = text.substr(0, first_run);
+    size_t last_run = std::string::npos;
+    for (size_t start = text.size() >= 4 ? text.size() - 4 : 0; start >= 1; --start) {
+      if (text.compare(start, 4, "0000") == 0) {
+        last_run = start;
+        break;
+      }
+      if (start == 1) break;
+    }
+    second = last_run == std::string::npos ? text.substr(1) : text.substr(last_run + 4);
+  }
+  for (char& c : second) c = char(std::toupper(static_cast<unsigned char>(c)));
+  return "Folders-" + first + "-" + second;
+}
+
+ModernStore::ModernStore(engine::EdbClass& reader, int version, ScanMode mode)
+    : reader_(reader), version_(version), mode_(mode), decoder_(version) {
+  BlobParserOptions options;
+  options.later_2013_variant = reader.extended_catalog();
+  InstallPropertyBlobParser(&decoder_, options);
+}
+
+const engine::TableDef* ModernStore::FindTable(const std::string& name) const {
+  return reader_.FindTable(name);
+}
+
+bool ModernStore::WalkMailboxes() {
+  const engine::TableDef* table = FindTable(kMailboxTable);
+  if (table) {
+    const Columns& c = Modern2013(version_) ? k2013 : k2010;
+    const engine::LongValueReader lv = reader_.long_values();
+    RowValueReader values(lv, *table);
+    reader_.ForEachRecord(*table, [&](const engine::RecordRef&, engine::RecordColumns& columns) {
+      FolderNode node;
+      std::optional<uint64_t> number = ReadId(values, *table, columns, c.mailbox_number, 1);
+      const int name_slot = ColumnSlot(*table, c.mailbox_name);
+      RowValue name;
+      if (!number) return true;
+      if (name_slot >= 0 && values.ReadOne(columns, size_t(name_slot), &name)) {
+        ItemRecords records;
+        decoder_.Decode(DecodePurpose::kFolderRow, c.folder_name, name.engine_type,
+                        name.code_page, ByteView(name.bytes), &records);
+        node.display_name = records.node.display_name;
+      }
+      node.folder_id = *number;
+      node.parent_id = kRootFolderId;
+      node.source_table = ModernFolderTableName(version_, *number);
+      node.state = 1;
+      folders_.Append(node);
+      return true;
+    });
+  }
+  public_store_ = folders_.only_fixed_entries();
+  return table != nullptr;
+}
+
+MailboxContext* ModernStore::Mailbox(uint32_t node_index) {
+  if (node_index >= folders_.size() || folders_[node_index].state != 1) return nullptr;
+  std::unique_ptr<MailboxContext>& slot = mailboxes_[node_index];
+  if (!slot) {
+    slot = std::make_unique<MailboxContext>();
+    slot->node_index = node_index;
+    slot->number = folders_[node_index].folder_id;
+    slot->folder_table = folders_[node_index].source_table;
+    Load(*slot);
+  }
+  return slot.get();
+}
+
+void ModernStore::Load(MailboxContext& m) {
+  m.loaded = true;
+  const Columns& c = Modern2013(version_) ? k2013 : k2010;
+  // Message and attachment tables follow from the folder table's name.
+  if (Modern2013(version_)) {
+    const std::string n = m.folder_table.substr(m.folder_table.find('_') + 1);
+    m.message_table = "Message_" + n;
+    m.attachment_table = "Attachment_" + n;
+  } else {
+    const std::string x = m.folder_table.substr(m.folder_table.find('-') + 1);
+    m.message_table = "Body-" + x;
+    m.attachment_table = "Attach-" + x;
+  }
+
+  if (const engine::TableDef* table = FindTable(m.folder_table)) {
+    const engine::LongValueReader lv = reader_.long_values();
+    RowValueReader values(lv, *table);
+    const std::vector<std::string> text_columns = {c.folder_name, c.container_class};
+    reader_.ForEachRecord(*table, [&](const engine::RecordRef&, engine::RecordColumns& columns) {
+      std::optional<uint64_t> id = ReadId(values, *table, columns, c.folder_id);
+      std::optional<uint64_t> parent = ReadId(values, *table, columns, c.parent_id);
+      if (!id) return true;
+      ItemRecords records;
+      for (const std::string& name : text_columns) {
+        RowValue v;
+        const int slot = ColumnSlot(*table, name);
+        if (slot >= 0 && values.ReadOne(columns, size_t(slot), &v)) {
+          decoder_.Decode(DecodePurpose::kFolderRow, name, v.engine_type, v.code_page,
+                          ByteView(v.bytes), &records);
+        }
+      }
+      FolderNode node = records.node;
+      if (node.display_name.empty()) return true;
+      node.folder_id = *id;
+      // Top folders of the mailbox hang under its ROOT.
+      node.parent_id = (!parent || *parent == 0 || *parent == m.number) ? kRootFolderId : *parent;
+      node.source_table = m.folder_table;
+      m.folders.Append(node);
+      return true;
+    });
+  }
+  m.folders.LinkTree(NullProgress());
+
+  const engine::TableDef* messages = FindTable(m.message_table);
+  if (!messages) return;
+  m.work_folder = (fs::path(work_folder_) / ("mailbox" + std::to_string(m.node_index))).string();
+  std::error_code ec;
+  fs::create_directories(m.work_folder, ec);
+  const std::string path = m.work_folder + "/" + kMessageLocationFile;
+  if (!m.message_locations.Create(path).ok()) return;
+  const engine::LongValueReader lv = reader_.long_values();
+  RowValueReader values(lv, *messages);
+  const char* key_column = Modern2013(version_) ? "MessageId" : "N67b0";
+  const char* folder_column = Modern2013(version_) ? "FolderId" : "Q6748";
+  reader_.ForEachRecord(*messages, [&](const engine::RecordRef& ref, engine::RecordColumns& columns) {
+    uint64_t key = 0;
+    if (Modern2013(version_)) {
+      key = ReadId(values, *messages, columns, key_column, kMinMessageIdSize).value_or(0);
+    } else {
+      const int slot = ColumnSlot(*messages, key_column);
+      RowValue v;
+      if (slot >= 0 && values.ReadOne(columns, size_t(slot), &v) && v.bytes.size() >= kIdSize) {
+        key = LoadU64LE(v.bytes.data());
+      }
+    }
+    if (key == 0) return true;  // no key, or one too short to map
+    m.message_map.Add(key);
+    m.message_locations.Append({ref.page_number, ref.tag_index});
+    if (std::optional<uint64_t> folder = ReadId(values, *messages, columns, folder_column)) {
+      m.folder_messages[*folder].push_back(key);
+    }
+    return true;
+  });
+  std::vector<uint64_t> dropped = m.message_map.Finish();
+  CompactLocations(&m.message_locations, dropped);
+}
+
+std::optional<engine::RecordRef> ModernStore::FindMessage(MailboxContext& m, uint64_t key) {
+  std::optional<uint64_t> ordinal = m.message_map.Find(key);
+  if (!ordinal) return std::nullopt;
+  std::optional<RecordLocation> loc = m.message_locations.Read(*ordinal);
+  if (!loc) return std::nullopt;
+  engine::RecordRef ref = reader_.MakeRecordRef(loc->page_number, loc->tag_index);
+  if (ref.kind != engine::kKindRecord) return std::nullopt;
+  return ref;
+}
+
+std::vector<MessageSummary> ModernStore::ListFolder(MailboxContext& m, uint32_t folder_index) {
+  std::vector<MessageSummary> rows;
+  const engine::TableDef* messages = FindTable(m.message_table);
+  if (!messages || folder_index >= m.folders.size()) return rows;
+  auto it = m.folder_messages.find(m.folders[folder_index].folder_id);
+  if (it == m.folder_messages.end()) return rows;
+  const engine::LongValueReader lv = reader_.long_values();
+  RowValueReader values(lv, *messages);
+  std::set<uint64_t> listed;
+  BlobParserOptions blob_options;
+  blob_options.later_2013_variant = reader_.extended_catalog();
+  for (uint64_t key : it->second) {
+    if (!listed.insert(key).second) continue;  // a repeated key was mapped once
+    std::optional<engine::RecordRef> ref = FindMessage(m, key);
+    if (!ref) continue;
+    engine::RecordColumns columns;
+    if (reader_.ReadRecordColumns(*ref, *messages, nullptr, &columns) != 0) continue;
+    ItemRecords records;
+    for (const std::string& name : ListColumns()) {
+      const int slot = ColumnSlot(*messages, name);
+      RowValue v;
+      if (slot < 0 || !values.ReadOne(columns, size_t(slot), &v)) continue;
+      if (name == "PropertyBlob") {
+        if (Modern2013(version_)) ParseBlobForList(ByteView(v.bytes), blob_options, &records.summary);
+        continue;
+      }
+      decoder_.Decode(DecodePurpose::kMessageListRow, name, v.engine_type, v.code_page,
+                      ByteView(v.bytes), &records);
+    }
+    records.summary.message_key = key;
+    rows.push_back(std::move(records.summary));
+  }
+  return rows;
+}
+
+std::optional<ItemRecords> ModernStore::OpenMessage(MailboxContext& m, uint64_t key,
+                                                    DecodePurpose* purpose) {
+  const engine::TableDef* messages = FindTable(m.message_table);
+  if (!messages) return std::nullopt;
+  std::optional<engine::RecordRef> ref = FindMessage(m, key);
+  if (!ref) return std::nullopt;
+  engine::RecordColumns columns;
+  if (reader_.ReadRecordColumns(*ref, *messages, nullptr, &columns) != 0) return std::nullopt;
+  const engine::LongValueReader lv = reader_.long_values();
+  RowValueReader reader(lv, *messages);
+  std::vector<RowValue> values = reader.Read(columns);
+  const Columns& c = Modern2013(version_) ? k2013 : k2010;
+  ItemRecords records;
+  for (const RowValue& v : values) {
+    if (v.column->name != c.message_class) continue;
+    decoder_.Decode(DecodePurpose::kMessageListRow, v.column->name, v.engine_type, v.code_page,
+                    ByteView(v.bytes), &records);
+  }
+  *purpose = PurposeForClass(records.summary.message_class);
+  for (const RowValue& v : values) {
+    decoder_.Decode(*purpose, v.column->name, v.engine_type, v.code_page, ByteView(v.bytes),
+                    &records);
+  }
+  records.summary.message_key = key;
+  return records;
+}
+
+std::vector<AttachmentRecord> ModernStore::ListAttachments(MailboxContext& m, uint64_t key) {
+  std::vector<AttachmentRecord> out;
+  const engine::TableDef* attachments = FindTable(m.attachment_table);
+  const engine::TableDef* messages = FindTable(m.message_table);
+  if (!attachments || !messages) return out;
+  // Attachment rows name their message by document id (2013+) or by its
+  // key (2010).
+  const char* owner_column = Modern2013(version_) ? "MessageDocumentId" : "N67b0";
+  const engine::LongValueReader lv = reader_.long_values();
+  uint64_t owner = key;
+  if (Modern2013(version_)) {
+    std::optional<engine::RecordRef> ref = FindMessage(m, key);
+    if (!ref) return out;
+    engine::RecordColumns columns;
+    if (reader_.ReadRecordColumns(*ref, *messages, nullptr, &columns) != 0) return out;
+    RowValueReader values(lv, *messages);
+    std::optional<uint64_t> id = ReadId(values, *messages, columns, owner_column, 1);
+    if (!id) return out;
+    owner = *id;
+  }
+  if (!m.attachments_indexed) {
+    m.attachments_indexed = true;
+    RowValueReader values(lv, *attachments);
+    reader_.ForEachRecord(*attachments, [&](const engine::RecordRef& ref,
+                                            engine::RecordColumns& columns) {
+      std::optional<uint64_t> id;
+      if (Modern2013(version_)) {
+        id = ReadId(values, *attachments, columns, owner_column, 1);
+      } else {
+        const int slot = ColumnSlot(*attachments, owner_column);
+        RowValue v;
+        if (slot >= 0 && values.ReadOne(columns, size_t(slot), &v) && v.bytes.size() >= kIdSize) {
+          id = LoadU64LE(v.bytes.data());
+        }
+      }
+      if (id) m.attachment_index.push_back({*id, {ref.page_number, ref.tag_index}});
+      return true;
+    });
+    std::stable_sort(m.attachment_index.begin(), m.attachment_index.end(),
+                     [](const auto& a, const auto& b) { return a.first < b.first; });
+  }
+  auto range = std::equal_range(m.attachment_index.begin(), m.attachment_index.end(),
+                                std::make_pair(owner, RecordLocation{}),
+                                [](const auto& a, const auto& b) { return a.first < b.first; });
+  RowValueReader values(lv, *attachments);
+  for (auto it = range.first; it != range.second; ++it) {
+    engine::RecordRef ref = reader_.MakeRecordRef(it->second.page_number, it->second.tag_index);
+    engine::RecordColumns columns;
+    if (ref.kind != engine::kKindRecord ||
+        reader_.ReadRecordColumns(ref, *attachments, nullptr, &columns) != 0) {
+      continue;
+    }
+    ItemRecords records;
+    for (const RowValue& v : values.Read(columns)) {
+      decoder_.Decode(DecodePurpose::kAttachmentRow, v.column->name, v.engine_type, v.code_page,
+                      ByteView(v.bytes), &records);
+    }
+    out.push_back(std::move(records.attachment));
+  }
+  return out;
+}
+
+}  // namespace tarnwell::store
