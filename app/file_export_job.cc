@@ -159,7 +159,7 @@ std::string DuplicateDigest(const store::MessageSummary& row, const bool dedup_b
   return std::string(reinterpret_cast<char*>(digest), length);
 }
 
-Status RunFileExport(store::LegacyStore& store, const FileExportRequest& request,
+Status RunFileExport(store::MailStore& store, const FileExportRequest& request,
                      RunningFlag& running, ProgressSink& progress, FileExportResult* result) {
   const ExportOptions& options = request.options;
   const bool mbox = options.format == OutputFormat::kMbox;
@@ -168,7 +168,7 @@ Status RunFileExport(store::LegacyStore& store, const FileExportRequest& request
                                 " export is not available yet");
   }
   // Every loop below polls this job's flag, the reader's walks included.
-  store.reader().SetRunningFlag(&running);
+  store.SetRunningFlag(&running);
   const std::time_t started = request.now ? request.now : std::time(nullptr);
   const std::string& destination = options.destination;
   std::error_code ec;
@@ -214,7 +214,7 @@ Status RunFileExport(store::LegacyStore& store, const FileExportRequest& request
     if (mbox && !mailbox.Open((dir / render::kMboxFileName).string()).ok()) {
       log.Error("cannot create " + (dir / render::kMboxFileName).string() + "\r\n");
     }
-    std::vector<store::MessageSummary> rows = store.ListFolder(folder.folder_index);
+    std::vector<store::MessageSummary> rows = store.ListFolder(folder.folder);
     counts.found = rows.size();
     log.ItemsFound(rows.size());
     progress.Range(0, kPermille);
@@ -238,13 +238,14 @@ Status RunFileExport(store::LegacyStore& store, const FileExportRequest& request
         continue;
       }
       store::DecodePurpose purpose;
-      std::optional<store::ItemRecords> item = store.OpenMessage(row.message_key, &purpose);
+      std::optional<store::ItemRecords> item = store.OpenMessage(folder.folder, row.message_key, &purpose);
       if (!item) {
         log.Error("item " + std::to_string(counter) + " of " + tree_path +
                   " has no message record\r\n");
         continue;
       }
-      std::vector<store::AttachmentRecord> attachments = store.ListAttachments(row.message_key);
+      std::vector<store::AttachmentRecord> attachments =
+          store.ListAttachments(folder.folder, row.message_key);
       const std::string message_class = row.message_class.empty() ? "IPM.Note" : row.message_class;
       const ItemKind kind = KindOf(message_class);
       render::HeaderStrings headers;

@@ -17,12 +17,12 @@
 #include "app/export_options.h"
 #include "base/progress_sink.h"
 #include "base/status.h"
-#include "store/legacy_store.h"
+#include "store/mail_store.h"
 
 namespace tarnwell::app {
 
 struct ExportFolder {
-  uint32_t folder_index = 0;       // in the store's folder list
+  store::FolderRef folder;         // the folder in its store
   std::vector<std::string> path;   // names from the source's top item down
 };
 
@@ -63,7 +63,7 @@ std::string ItemFileName(const store::MessageSummary& row, const std::string& da
 // UTF-16 unit reduced to its low byte, hashed with MD5.
 std::string DuplicateDigest(const store::MessageSummary& row, const bool dedup_by[6]);
 
-Status RunFileExport(store::LegacyStore& store, const FileExportRequest& request,
+Status RunFileExport(store::MailStore& store, const FileExportRequest& request,
                      RunningFlag& running, ProgressSink& progress, FileExportResult* result);
 
 }  // namespace tarnwell::app

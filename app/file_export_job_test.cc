@@ -41,7 +41,14 @@ class Collector : public store::FolderTreeSink {
     return 0;
   }
   int64_t AddFolder(int64_t parent, const std::string& text, int, uint32_t index) override {
-    ExportFolder f{index, paths_[parent]};
+    return Add(parent, text, {-1, index});
+  }
+  int64_t AddMailboxFolder(int64_t parent, const std::string& text, int, int32_t mailbox,
+                           uint32_t index) override {
+    return Add(parent, text, {mailbox, index});
+  }
+  int64_t Add(int64_t parent, const std::string& text, store::FolderRef ref) {
+    ExportFolder f{ref, paths_[parent]};
     f.path.push_back(text);
     paths_[int64_t(folders.size()) + 1] = f.path;
     folders.push_back(f);

@@ -10,7 +10,7 @@
 #include "base/progress_sink.h"
 #include "engine/edb_class.h"
 #include "store/item_records.h"
-#include "store/legacy_store.h"
+#include "store/mail_store.h"
 
 namespace tarnwell::app {
 
@@ -25,6 +25,7 @@ struct RunSettings {
   uint32_t non_english = 1;  // "Support Non English characters"
   uint32_t adjustment_check = 0;  // runs "Checking Adjustment Factor"
   bool load_snapshot = false;
+  bool mailboxes_only = false;  // modern stores: show the mailboxes, load them when used
 };
 
 // One scanned source. Its 1-based position in the list of sources is its
@@ -36,8 +37,9 @@ struct SourceEntry {
   uint32_t non_english = 1;
   std::string edb_path;
   std::string work_folder;  // temp root + source number
+  bool mailboxes_only = false;  // modern stores: load no mailbox during the scan
   std::unique_ptr<engine::EdbClass> reader;
-  std::unique_ptr<store::LegacyStore> store;
+  std::unique_ptr<store::MailStore> store;
 };
 
 }  // namespace tarnwell::app

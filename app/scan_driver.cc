@@ -3,6 +3,8 @@
 #include <filesystem>
 
 #include "engine/catalog.h"
+#include "store/legacy_store.h"
+#include "store/modern_store.h"
 
 namespace tarnwell::app {
 namespace {
@@ -58,6 +60,7 @@ Status OpenSource(const RunSettings& settings, uint64_t source_number, ProgressS
   if (!reader) return Status::InvalidArgument(kVersionNotDetected);
   const bool legacy = settings.version_code != engine::kExchange2010 &&
                       settings.version_code != engine::kExchange2013;
+  source->mailboxes_only = settings.mailboxes_only;
   if (legacy && !settings.stm_path.empty() &&
       !reader->OpenStreamFile(settings.stm_path, engine::SourceDescriptor{})) {
     progress.Message(kStmCannotBeOpened);  // the scan goes on without it
@@ -124,19 +127,28 @@ ScanOutcome RunScan(SourceEntry& source, uint64_t source_number, RunningFlag& ru
     }
   }
 
-  source.store = std::make_unique<store::LegacyStore>(reader, source.version_code, source.mode);
-  store::LegacyStore& store = *source.store;
-  store.SetWorkFolder(source.work_folder);
+  const bool modern = source.version_code == engine::kExchange2010 ||
+                      source.version_code == engine::kExchange2013;
+  if (modern) {
+    auto s = std::make_unique<store::ModernStore>(reader, source.version_code, source.mode);
+    s->SetWorkFolder(source.work_folder);
+    source.store = std::move(s);
+  } else {
+    auto s = std::make_unique<store::LegacyStore>(reader, source.version_code, source.mode);
+    s->SetWorkFolder(source.work_folder);
+    source.store = std::move(s);
+  }
+  store::MailStore& store = *source.store;
 
   stages.Enter(texts.mailboxes);
   store.WalkMailboxes();
-  stages.Enter(texts.folders);
-  store.WalkFolders();
+  // The modern generation names no stage for its per-mailbox folder tables.
+  if (!modern) stages.Enter(texts.folders);
+  if (!modern || !source.mailboxes_only) store.WalkFolders();
   stages.Enter(texts.tree);
   store.LinkTree(progress);
   stages.Enter(texts.show);
-  outcome.tree_shown =
-      store::ShowTree(store.folders(), store.public_store(), source.edb_path, source_number, tree);
+  outcome.tree_shown = store.ShowTree(source.edb_path, source_number, tree);
   if (!outcome.tree_shown) return finish();
   stages.Enter(texts.messages);
   store.BuildMessageMap();

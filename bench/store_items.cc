@@ -35,14 +35,14 @@ int main(int argc, char** argv) {
   }
   session.BeginJob();
   t = Clock::now();
-  std::vector<tarnwell::store::MessageSummary> rows = session.store().ListFolder(folder->index);
+  std::vector<tarnwell::store::MessageSummary> rows = session.store().ListFolder(folder->folder);
   std::printf("list\t%.6f\t%zu items\n", seconds(t), rows.size());
   t = Clock::now();
   size_t opened = 0, attachments = 0;
   for (const auto& row : rows) {
     tarnwell::store::DecodePurpose purpose;
-    if (session.store().OpenMessage(row.message_key, &purpose)) ++opened;
-    attachments += session.store().ListAttachments(row.message_key).size();
+    if (session.store().OpenMessage(folder->folder, row.message_key, &purpose)) ++opened;
+    attachments += session.store().ListAttachments(folder->folder, row.message_key).size();
   }
   std::printf("show\t%.6f\t%zu items\t%zu attachments\n", seconds(t), opened, attachments);
   return 0;

@@ -115,7 +115,7 @@ Status RunExport(const ExportCommandOptions& o, ProgressSink& progress, ExportSu
   for (app::ItemId item : tree.CheckedFolders()) {
     if (item == top) continue;
     const ShownFolder& f = session.folders()[tree.GetItemData(item)];
-    request.folders.push_back({f.index, f.path});
+    request.folders.push_back({f.folder, f.path});
   }
   session.BeginJob();
   app::FileExportResult result;

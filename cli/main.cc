@@ -59,6 +59,8 @@ void AddScanOptions(CLI::App* cmd, tarnwell::cli::ScanOptions* o) {
   cmd->add_option("--stm", o->stm, "the streaming file of an Exchange 2000/2003 database");
   cmd->add_option("--temp", o->temp, "temporary folder (default: a fresh one, removed at the end)");
   cmd->add_flag("--adjust", o->adjust, "handle alignment errors: find where the database starts");
+  cmd->add_flag("--mailboxes-only", o->mailboxes_only,
+                "Exchange 2010/2013: show the mailboxes; read a mailbox's folders when used");
 }
 
 int Fail(const std::string& path, const tarnwell::Status& s) {

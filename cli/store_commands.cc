@@ -172,7 +172,6 @@ std::string FormatScanText(StoreSession& session) {
 }
 
 std::string FormatScanJson(StoreSession& session, const ScanOptions& options) {
-  const store::FolderList& folders = session.store().folders();
   JsonWriter w;
   w.BeginObject();
   w.Key("source").String(options.db);
@@ -181,7 +180,9 @@ std::string FormatScanJson(StoreSession& session, const ScanOptions& options) {
   w.Key("public_store").Bool(session.store().public_store());
   w.Key("folders").BeginArray();
   for (const ShownFolder& f : session.folders()) {
-    const store::FolderNode& node = folders[f.index];
+    const store::FolderNode* found = session.store().Folder(f.folder);
+    if (!found) continue;
+    const store::FolderNode& node = *found;
     w.BeginObject();
     w.Key("ref").String(f.ref);
     w.Key("path").BeginArray();
@@ -203,7 +204,7 @@ Status RunList(StoreSession& session, const std::string& ref, bool json, std::st
   const ShownFolder* folder = session.FindFolder(ref);
   if (!folder) return Status::NotFound("no folder with reference \"" + ref + "\"");
   session.BeginJob();
-  std::vector<store::MessageSummary> rows = session.store().ListFolder(folder->index);
+  std::vector<store::MessageSummary> rows = session.store().ListFolder(folder->folder);
   JsonWriter w;
   if (json) w.BeginArray();
   for (const store::MessageSummary& s : rows) {
@@ -242,19 +243,20 @@ Status RunShow(StoreSession& session, const std::string& ref, size_t item, bool 
   const ShownFolder* folder = session.FindFolder(ref);
   if (!folder) return Status::NotFound("no folder with reference \"" + ref + "\"");
   session.BeginJob();
-  std::vector<store::MessageSummary> rows = session.store().ListFolder(folder->index);
+  std::vector<store::MessageSummary> rows = session.store().ListFolder(folder->folder);
   if (item == 0 || item > rows.size()) {
     return Status::NotFound(fmt::format("no item {} in a folder of {} items", item, rows.size()));
   }
   const store::MessageSummary& row = rows[item - 1];
   store::DecodePurpose purpose = store::DecodePurpose::kMessageDetail;
-  std::optional<store::ItemRecords> record = session.store().OpenMessage(row.message_key, &purpose);
+  std::optional<store::ItemRecords> record =
+      session.store().OpenMessage(folder->folder, row.message_key, &purpose);
   if (!record) {
     return Status::NotFound("the message " + KeyHex(row.message_key) +
                             " of the folder list has no record in the message table");
   }
   std::vector<store::AttachmentRecord> attachments =
-      session.store().ListAttachments(row.message_key);
+      session.store().ListAttachments(folder->folder, row.message_key);
   JsonWriter w;
   w.BeginObject();
   w.Key("key").String(KeyHex(row.message_key));

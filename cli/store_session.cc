@@ -13,13 +13,13 @@ namespace {
 
 namespace fs = std::filesystem;
 
-// Collects the tree the scan shows, with each folder's path of names.
+// Collects the tree the scan shows, with each folder's path of names. The
+// reference of a folder is its id in hexadecimal; in a store that keeps a
+// folder list per mailbox, the mailbox number and the folder id.
 class CollectingTree : public store::FolderTreeSink {
  public:
-  CollectingTree(const store::FolderList* folders, std::vector<ShownFolder>* out,
-                 std::string* top_text)
-      : folders_(folders), out_(out), top_text_(top_text) {}
-  void set_folders(const store::FolderList* folders) { folders_ = folders; }
+  CollectingTree(app::SourceEntry* source, std::vector<ShownFolder>* out, std::string* top_text)
+      : source_(source), out_(out), top_text_(top_text) {}
 
   int64_t AddTopItem(const std::string& text, int, uint64_t) override {
     *top_text_ = text;
@@ -28,10 +28,27 @@ class CollectingTree : public store::FolderTreeSink {
   }
   int64_t AddFolder(int64_t parent, const std::string& text, int icon,
                     uint32_t folder_index) override {
+    return Add(parent, text, icon, {-1, folder_index});
+  }
+  int64_t AddMailboxFolder(int64_t parent, const std::string& text, int icon, int32_t mailbox,
+                           uint32_t folder_index) override {
+    return Add(parent, text, icon, {mailbox, folder_index});
+  }
+
+ private:
+  int64_t Add(int64_t parent, const std::string& text, int icon, store::FolderRef ref) {
+    store::MailStore& store = *source_->store;
     ShownFolder f;
-    f.index = folder_index;
+    f.folder = ref;
     f.icon = icon;
-    f.ref = fmt::format("{:x}", (*folders_)[folder_index].folder_id);
+    const store::FolderNode* node = store.Folder(ref);
+    const uint64_t id = node ? node->folder_id : 0;
+    if (ref.mailbox >= 0) {
+      const store::FolderNode* mailbox = store.Folder({-1, uint32_t(ref.mailbox)});
+      f.ref = fmt::format("{:x}:{:x}", mailbox ? mailbox->folder_id : 0, id);
+    } else {
+      f.ref = fmt::format("{:x}", id);
+    }
     f.path = paths_[parent];
     f.path.push_back(text);
     f.parent = int(parent) - 1;  // handles are positions + 1; the top item is 0
@@ -41,30 +58,10 @@ class CollectingTree : public store::FolderTreeSink {
     return handle;
   }
 
- private:
-  const store::FolderList* folders_;
+  app::SourceEntry* source_;
   std::vector<ShownFolder>* out_;
   std::string* top_text_;
   std::map<int64_t, std::vector<std::string>> paths_;
-};
-
-// The folder list lives in the store, which the driver makes: the sink
-// reaches it through the source entry.
-class SourceTree : public store::FolderTreeSink {
- public:
-  SourceTree(app::SourceEntry* source, std::vector<ShownFolder>* out, std::string* top_text)
-      : source_(source), inner_(nullptr, out, top_text) {}
-  int64_t AddTopItem(const std::string& text, int icon, uint64_t n) override {
-    inner_.set_folders(&source_->store->folders());
-    return inner_.AddTopItem(text, icon, n);
-  }
-  int64_t AddFolder(int64_t parent, const std::string& text, int icon, uint32_t index) override {
-    return inner_.AddFolder(parent, text, icon, index);
-  }
-
- private:
-  app::SourceEntry* source_;
-  CollectingTree inner_;
 };
 
 }  // namespace
@@ -108,10 +105,6 @@ Status StoreSession::Open(const ScanOptions& options, ProgressSink& progress) {
   int code = 0;
   Status s = ParseVersion(options.version, options.db, &code);
   if (!s.ok()) return s;
-  if (code == engine::kExchange2010 || code == engine::kExchange2013) {
-    return Status::NotSupported(std::string(VersionName(code)) +
-                                " mailbox databases are not read yet");
-  }
   if (options.mode != "standard" && options.mode != "advance") {
     return Status::InvalidArgument("unknown mode \"" + options.mode + "\" (standard or advance)");
   }
@@ -128,11 +121,12 @@ Status StoreSession::Open(const ScanOptions& options, ProgressSink& progress) {
   settings_.version_code = code;
   settings_.mode = options.mode == "advance" ? store::ScanMode::kAdvance : store::ScanMode::kStandard;
   settings_.adjustment_check = options.adjust ? 1 : 0;
+  settings_.mailboxes_only = options.mailboxes_only;
   constexpr uint64_t kSourceNumber = 1;
   s = app::OpenSource(settings_, kSourceNumber, progress, &source_);
   if (!s.ok()) return s;
   running_.store(true);
-  SourceTree tree(&source_, &folders_, &top_text_);
+  CollectingTree tree(&source_, &folders_, &top_text_);
   outcome_ = app::RunScan(source_, kSourceNumber, running_, progress, tree);
   if (!outcome_.tree_shown) {
     return Status::Corruption("no mailbox or public folder tree was found in " + options.db);

@@ -21,12 +21,13 @@ struct ScanOptions {
   std::string stm;
   std::string temp;              // empty: a fresh folder, removed at the end
   bool adjust = false;
+  bool mailboxes_only = false;   // modern stores: load mailboxes only when used
 };
 
 struct ShownFolder {
   std::string ref;                // the folder id in hexadecimal; stable across runs
   std::vector<std::string> path;  // names from the source's top item down
-  uint32_t index = 0;             // in the store's folder list
+  store::FolderRef folder;        // the folder in its store
   int icon = 0;
   int parent = -1;                // position of the parent in the shown list; -1: the top item
 };
@@ -44,7 +45,7 @@ class StoreSession {
   const app::ScanOutcome& outcome() const { return outcome_; }
   const std::vector<ShownFolder>& folders() const { return folders_; }
   const ShownFolder* FindFolder(const std::string& ref) const;
-  store::LegacyStore& store() { return *source_.store; }
+  store::MailStore& store() { return *source_.store; }
   const app::SourceEntry& source() const { return source_; }
   const std::string& top_text() const { return top_text_; }
   // A job after the scan (list, show) raises the running flag again: the

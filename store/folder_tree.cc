@@ -98,18 +98,26 @@ int IconForFolderName(const std::string& display_name) {
 
 namespace {
 
-void InsertChildren(const FolderList& folders, uint32_t index, int64_t item, FolderTreeSink& sink,
-                    std::set<uint32_t>& shown) {
+void InsertChildrenOnce(const FolderList& folders, uint32_t index, int64_t item,
+                        FolderTreeSink& sink, int32_t mailbox, std::set<uint32_t>& shown) {
   for (uint32_t child : folders.Children(index)) {
     if (!shown.insert(child).second) continue;  // a cycle in damaged links
     const FolderNode& node = folders[child];
-    const int64_t handle =
-        sink.AddFolder(item, node.display_name, IconForFolderName(node.display_name), child);
-    InsertChildren(folders, child, handle, sink, shown);
+    const int icon = IconForFolderName(node.display_name);
+    const int64_t handle = mailbox >= 0
+                               ? sink.AddMailboxFolder(item, node.display_name, icon, mailbox, child)
+                               : sink.AddFolder(item, node.display_name, icon, child);
+    InsertChildrenOnce(folders, child, handle, sink, mailbox, shown);
   }
 }
 
 }  // namespace
+
+void InsertChildren(const FolderList& folders, uint32_t index, int64_t item, FolderTreeSink& sink,
+                    int32_t mailbox) {
+  std::set<uint32_t> shown{index};
+  InsertChildrenOnce(folders, index, item, sink, mailbox, shown);
+}
 
 bool ShowTree(const FolderList& folders, bool public_store, const std::string& database_path,
               uint64_t source_number, FolderTreeSink& sink) {
@@ -117,8 +125,7 @@ bool ShowTree(const FolderList& folders, bool public_store, const std::string& d
   if (start < 0) return false;
   const std::string text = public_store ? folders[start].display_name : database_path;
   const int64_t top = sink.AddTopItem(text, kIconDatabase, source_number);
-  std::set<uint32_t> shown{uint32_t(start)};
-  InsertChildren(folders, uint32_t(start), top, sink, shown);
+  InsertChildren(folders, uint32_t(start), top, sink);
   return true;
 }
 

@@ -66,6 +66,12 @@ class FolderTreeSink {
   virtual int64_t AddTopItem(const std::string& text, int icon, uint64_t source_number) = 0;
   virtual int64_t AddFolder(int64_t parent, const std::string& text, int icon,
                             uint32_t folder_index) = 0;
+  // A folder of a mailbox that keeps its own folder list (modern stores).
+  virtual int64_t AddMailboxFolder(int64_t parent, const std::string& text, int icon,
+                                   int32_t mailbox, uint32_t folder_index) {
+    (void)mailbox;
+    return AddFolder(parent, text, icon, folder_index);
+  }
 };
 
 // Shows the tree: a private store (at least one mailbox) under an item named
@@ -73,6 +79,11 @@ class FolderTreeSink {
 // "Public Root" node. False when the start node does not exist.
 bool ShowTree(const FolderList& folders, bool public_store, const std::string& database_path,
               uint64_t source_number, FolderTreeSink& sink);
+
+// Inserts the children of node `index` of `folders` below `item`, depth
+// first; with `mailbox` >= 0 through AddMailboxFolder.
+void InsertChildren(const FolderList& folders, uint32_t index, int64_t item,
+                    FolderTreeSink& sink, int32_t mailbox = -1);
 
 }  // namespace tarnwell::store
 

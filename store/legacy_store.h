@@ -30,6 +30,7 @@
 #include "store/item_records.h"
 #include "store/key_ordinal_map.h"
 #include "store/location_file.h"
+#include "store/mail_store.h"
 #include "store/property_decoder.h"
 
 namespace tarnwell::store {
@@ -47,7 +48,7 @@ std::string ContentTableName(uint64_t folder_id);
 // The purpose an item of this message class is opened for.
 DecodePurpose PurposeForClass(const std::string& message_class);
 
-class LegacyStore {
+class LegacyStore : public MailStore {
  public:
   // `reader` must have parsed its catalog and outlive the store.
   LegacyStore(engine::EdbClass& reader, int version, ScanMode mode);
@@ -57,18 +58,23 @@ class LegacyStore {
 
   // Reads "Mailbox" into the folder list; afterwards the store is a public
   // folder store when no mailbox was found.
-  bool WalkMailboxes();
-  bool WalkFolders();
-  bool public_store() const { return public_store_; }
-  void LinkTree(ProgressSink& progress) { folders_.LinkTree(progress); }
+  bool WalkMailboxes() override;
+  bool WalkFolders() override;
+  bool public_store() const override { return public_store_; }
+  void SetRunningFlag(RunningFlag* running) override { reader_.SetRunningFlag(running); }
+  void LinkTree(ProgressSink& progress) override { folders_.LinkTree(progress); }
+  bool ShowTree(const std::string& database_path, uint64_t source_number,
+                FolderTreeSink& sink) override {
+    return store::ShowTree(folders_, public_store_, database_path, source_number, sink);
+  }
   const FolderList& folders() const { return folders_; }
 
   // Finds "Msg"; in Advance and Deep Mode walks it into the MessageMap and
   // "Msgid.txt".
-  bool BuildMessageMap();
+  bool BuildMessageMap() override;
   // Finds the attachment table; in Advance and Deep Mode walks it into the
   // AttachmentMap and "Attachid.txt".
-  bool BuildAttachmentMap();
+  bool BuildAttachmentMap() override;
   const KeyOrdinalMap& message_map() const { return message_map_; }
   const KeyOrdinalMap& attachment_map() const { return attachment_map_; }
   const engine::TableDef* message_table() const { return message_table_; }
@@ -91,6 +97,18 @@ class LegacyStore {
   std::optional<ItemRecords> OpenMessage(uint64_t message_key, DecodePurpose* purpose);
   // The attachments of message `key`, in table order.
   std::vector<AttachmentRecord> ListAttachments(uint64_t message_key);
+
+  // The store-wide view (`ref.mailbox` is ignored: one folder list).
+  const FolderNode* Folder(FolderRef ref) override {
+    return ref.folder < folders_.size() ? &folders_[ref.folder] : nullptr;
+  }
+  std::vector<MessageSummary> ListFolder(FolderRef ref) override { return ListFolder(ref.folder); }
+  std::optional<ItemRecords> OpenMessage(FolderRef, uint64_t key, DecodePurpose* purpose) override {
+    return OpenMessage(key, purpose);
+  }
+  std::vector<AttachmentRecord> ListAttachments(FolderRef, uint64_t key) override {
+    return ListAttachments(key);
+  }
 
   int version() const { return version_; }
   ScanMode mode() const { return mode_; }

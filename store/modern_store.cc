@@ -359,4 +359,54 @@ std::vector<AttachmentRecord> ModernStore::ListAttachments(MailboxContext& m, ui
   return out;
 }
 
+bool ModernStore::WalkFolders() {
+  for (uint32_t i = 0; i < folders_.size(); ++i) {
+    if (folders_[i].state == 1) Mailbox(i);
+  }
+  return true;
+}
+
+bool ModernStore::ShowTree(const std::string& database_path, uint64_t source_number,
+                           FolderTreeSink& sink) {
+  const int start = folders_.FindByName(public_store_ ? kPublicRootName : kRootName);
+  if (start < 0) return false;
+  const int64_t top = sink.AddTopItem(
+      public_store_ ? folders_[start].display_name : database_path, kIconDatabase, source_number);
+  for (uint32_t child : folders_.Children(uint32_t(start))) {
+    const FolderNode& node = folders_[child];
+    const int64_t item =
+        sink.AddFolder(top, node.display_name, IconForFolderName(node.display_name), child);
+    auto it = mailboxes_.find(child);
+    if (it != mailboxes_.end() && it->second->loaded) {
+      InsertChildren(it->second->folders, kRootIndex, item, sink, int32_t(child));
+    }
+  }
+  return true;
+}
+
+const FolderNode* ModernStore::Folder(FolderRef ref) {
+  if (ref.mailbox < 0) return ref.folder < folders_.size() ? &folders_[ref.folder] : nullptr;
+  MailboxContext* m = Mailbox(uint32_t(ref.mailbox));
+  return m && ref.folder < m->folders.size() ? &m->folders[ref.folder] : nullptr;
+}
+
+std::vector<MessageSummary> ModernStore::ListFolder(FolderRef ref) {
+  if (ref.mailbox < 0) return {};  // a mailbox node lists nothing
+  MailboxContext* m = Mailbox(uint32_t(ref.mailbox));
+  return m ? ListFolder(*m, ref.folder) : std::vector<MessageSummary>();
+}
+
+std::optional<ItemRecords> ModernStore::OpenMessage(FolderRef ref, uint64_t key,
+                                                    DecodePurpose* purpose) {
+  if (ref.mailbox < 0) return std::nullopt;
+  MailboxContext* m = Mailbox(uint32_t(ref.mailbox));
+  return m ? OpenMessage(*m, key, purpose) : std::nullopt;
+}
+
+std::vector<AttachmentRecord> ModernStore::ListAttachments(FolderRef ref, uint64_t key) {
+  if (ref.mailbox < 0) return {};
+  MailboxContext* m = Mailbox(uint32_t(ref.mailbox));
+  return m ? ListAttachments(*m, key) : std::vector<AttachmentRecord>();
+}
+
 }  // namespace tarnwell::store

@@ -30,6 +30,7 @@
 #include "store/item_records.h"
 #include "store/key_ordinal_map.h"
 #include "store/location_file.h"
+#include "store/mail_store.h"
 #include "store/property_decoder.h"
 
 namespace tarnwell::store {
@@ -58,7 +59,7 @@ struct MailboxContext {
   bool attachments_indexed = false;
 };
 
-class ModernStore {
+class ModernStore : public MailStore {
  public:
   ModernStore(engine::EdbClass& reader, int version, ScanMode mode);
 
@@ -67,10 +68,25 @@ class ModernStore {
 
   // Reads "Mailbox": one node under ROOT per mailbox, each naming its folder
   // table (state byte 1).
-  bool WalkMailboxes();
+  bool WalkMailboxes() override;
+  // Loads every mailbox, as if each had been selected.
+  bool WalkFolders() override;
   const FolderList& folders() const { return folders_; }
-  bool public_store() const { return public_store_; }
-  void LinkTree(ProgressSink& progress) { folders_.LinkTree(progress); }
+  bool public_store() const override { return public_store_; }
+  void SetRunningFlag(RunningFlag* running) override { reader_.SetRunningFlag(running); }
+  void LinkTree(ProgressSink& progress) override { folders_.LinkTree(progress); }
+  // The mailboxes under the top item, each loaded mailbox's folders under it.
+  bool ShowTree(const std::string& database_path, uint64_t source_number,
+                FolderTreeSink& sink) override;
+  // A modern store's maps belong to its mailboxes: built as they load.
+  bool BuildMessageMap() override { return true; }
+  bool BuildAttachmentMap() override { return true; }
+
+  const FolderNode* Folder(FolderRef ref) override;
+  std::vector<MessageSummary> ListFolder(FolderRef ref) override;
+  std::optional<ItemRecords> OpenMessage(FolderRef ref, uint64_t key,
+                                         DecodePurpose* purpose) override;
+  std::vector<AttachmentRecord> ListAttachments(FolderRef ref, uint64_t key) override;
 
   // The context of the mailbox at node `index`, loaded on first use; null
   // for a node that is not a mailbox.
