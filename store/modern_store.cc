@@ -293,6 +293,9 @@ std::optional<ItemRecords> ModernStore::OpenMessage(MailboxContext& m, uint64_t 
     decoder_.Decode(*purpose, v.column->name, v.engine_type, v.code_page, ByteView(v.bytes),
                     &records);
   }
+  // "NativeBody" holds the plain text itself when the body type says so.
+  constexpr uint16_t kBodyTypePlainText = 1;
+  if (records.message.body_type == kBodyTypePlainText) records.message.body_is_text = true;
   records.summary.message_key = key;
   return records;
 }

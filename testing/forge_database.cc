@@ -170,6 +170,7 @@ DatabaseWriter::DatabaseWriter(const DatabaseSpec& spec, PageSink* sink)
   spec_.page_format_flags = spec.page_format_flags;
   spec_.prefix_compression = spec.prefix_compression;
   spec_.database_state = spec.database_state;
+  spec_.catalog_revision = spec.catalog_revision;
   status_ = CheckFormat(spec_);
   format_.page_size = spec.page_size;
   format_.revision = spec.format_revision;
@@ -216,7 +217,8 @@ void DatabaseWriter::AddTable(const std::string& name, const std::vector<ColumnS
 
 Status DatabaseWriter::Finish(Bytes* header, Manifest* manifest) {
   if (!status_.ok()) return status_;
-  const std::vector<ColumnSpec> catalog_columns = CatalogColumns(spec_.format_revision);
+  const uint32_t catalog_revision = spec_.catalog_revision.value_or(spec_.format_revision);
+  const std::vector<ColumnSpec> catalog_columns = CatalogColumns(catalog_revision);
   std::vector<CatalogTable> catalog_tables;
   catalog_tables.push_back({"MSysObjects", kCatalogObjectId, kCatalogRootPage, &catalog_columns});
   catalog_tables.push_back(
@@ -228,7 +230,7 @@ Status DatabaseWriter::Finish(Bytes* header, Manifest* manifest) {
   }
 
   std::vector<TreeEntry> catalog;
-  Status s = BuildCatalogEntries(spec_.format_revision, layout_, catalog_tables, &catalog);
+  Status s = BuildCatalogEntries(catalog_revision, layout_, catalog_tables, &catalog);
   if (!s.ok()) return s;
   TreeOptions options = base_options_;
   for (const auto& [object_id, root] :

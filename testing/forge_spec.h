@@ -121,6 +121,10 @@ struct DatabaseSpec {
   std::optional<uint32_t> page_format_flags;
   bool prefix_compression = true;
   uint32_t database_state = 3;  // clean shutdown
+  // The revision whose catalog columns the catalog records have (unset:
+  // format_revision). 17 in a revision-20 file gives catalog records whose
+  // last fixed column is 11 instead of 12, as earlier Exchange 2013 stores have.
+  std::optional<uint32_t> catalog_revision;
   std::vector<TableSpec> tables;
 };
 

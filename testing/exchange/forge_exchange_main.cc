@@ -1,6 +1,6 @@
-// tarnwell-forge-exchange: writes a legacy Exchange store and its manifest.
+// tarnwell-forge-exchange: writes an Exchange store and its manifest.
 //
-//   tarnwell-forge-exchange OUT.edb [--version 4|1|2] [--public] [--damage]
+//   tarnwell-forge-exchange OUT.edb [--version 4|1|2|3|5] [--later-2013] [--public] [--damage]
 //                           [--messages N] [--large-folder N] [--size-mib N]
 //                           [--seed N] [--manifest OUT.json]
 //
@@ -12,12 +12,14 @@
 #include <fstream>
 #include <string>
 
+#include "testing/exchange/modern_store_builder.h"
 #include "testing/exchange/store_builder.h"
 
 namespace {
 
 constexpr const char kUsage[] =
-    "usage: tarnwell-forge-exchange OUT.edb [--version 4|1|2] [--public] [--damage]\n"
+    "usage: tarnwell-forge-exchange OUT.edb [--version 4|1|2|3|5] [--later-2013] [--public]\n"
+    "                               [--damage]\n"
     "                               [--messages N] [--large-folder N] [--size-mib N]\n"
     "                               [--seed N] [--manifest OUT.json]\n";
 constexpr uint64_t kMiB = 1 << 20;
@@ -46,10 +48,15 @@ int main(int argc, char** argv) {
   LegacyStoreOptions options;
   std::string manifest_path;
   uint64_t size_mib = 0;
+  bool later_2013 = false;
   for (int i = 2; i < argc; ++i) {
     const std::string arg = argv[i];
     if (arg == "--public") {
       options.public_store = true;
+      continue;
+    }
+    if (arg == "--later-2013") {
+      later_2013 = true;
       continue;
     }
     if (arg == "--damage") {
@@ -96,7 +103,22 @@ int main(int argc, char** argv) {
   options.record_items = options.bulk.messages <= 10000;
 
   StoreManifest manifest;
-  tarnwell::Status s = BuildLegacyStore(options, argv[1], &manifest);
+  tarnwell::Status s;
+  if (options.version == kExchange2010 || options.version == kExchange2013) {
+    if (options.public_store) {
+      std::fputs("tarnwell-forge-exchange: modern stores have no public variant\n", stderr);
+      return 2;
+    }
+    ModernStoreOptions modern;
+    modern.version = options.version;
+    modern.later_2013_variant = later_2013;
+    if (options.damage.orphan_folder) modern.damage = ModernDamageOptions::All();
+    modern.bulk = options.bulk;
+    modern.record_items = options.record_items;
+    s = BuildModernStore(modern, argv[1], &manifest);
+  } else {
+    s = BuildLegacyStore(options, argv[1], &manifest);
+  }
   if (!s.ok()) {
     std::fprintf(stderr, "tarnwell-forge-exchange: %s\n", s.message().c_str());
     return 1;

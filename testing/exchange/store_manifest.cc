@@ -88,6 +88,10 @@ void Item(JsonWriter& w, const ManifestItem& it) {
     w.EndObject();
   }
   w.EndArray();
+  w.Key("cc").String(it.cc);
+  w.Key("flags_text").String(it.flags_text);
+  w.Key("body_type").Uint(it.body_type);
+  w.Key("document_id").Int(it.document_id);
   w.Key("attachments").BeginArray();
   for (const ManifestAttachment& a : it.attachments) Attachment(w, a);
   w.EndArray();
@@ -156,6 +160,11 @@ std::string ManifestJson(const StoreManifest& m) {
     w.Key("number").Uint(mb.number);
     w.Key("property").String(Hex(mb.property));
     w.Key("row").Uint(mb.row);
+    w.Key("folder_table").String(mb.folder_table);
+    w.Key("message_table").String(mb.message_table);
+    w.Key("attachment_table").String(mb.attachment_table);
+    w.Key("header_table").String(mb.header_table);
+    w.Key("damage").String(mb.damage);
     w.EndObject();
   }
   w.EndArray();
@@ -164,6 +173,15 @@ std::string ManifestJson(const StoreManifest& m) {
   w.EndArray();
   w.Key("duplicates").BeginArray();
   for (const DuplicateRow& d : m.duplicates) {
+    w.BeginObject();
+    w.Key("key").String(Hex(d.key));
+    w.Key("subject").String(d.subject);
+    w.EndObject();
+  }
+  w.EndArray();
+  w.Key("later_2013_variant").Bool(m.later_2013_variant);
+  w.Key("unmapped").BeginArray();
+  for (const DuplicateRow& d : m.unmapped) {
     w.BeginObject();
     w.Key("key").String(Hex(d.key));
     w.Key("subject").String(d.subject);

@@ -27,6 +27,13 @@ struct ManifestMailbox {
   uint64_t number = 0;  // "Q6764"; also the parent id of the mailbox's top folder
   Bytes property;       // "N66a0"
   uint32_t row = 0;     // position in the "Mailbox" table
+  // Modern stores (codes 3 and 5): the names of the mailbox's own tables, and
+  // "no_folder_table" when none of them was written, on purpose.
+  std::string folder_table;
+  std::string message_table;
+  std::string attachment_table;
+  std::string header_table;  // code 3: the list rows of its folders
+  std::string damage;
 };
 
 struct ListMember {
@@ -79,6 +86,11 @@ struct ManifestItem {
   std::vector<ListMember> members;              // "MN81a9"
   std::vector<ManifestAttachment> attachments;  // attachment-table order
   bool in_msg_table = true;                     // false: a content-table row with no "Msg" row
+  // Modern stores only.
+  std::string cc;           // Cc line as written (property 0x0E03; empty: not written)
+  std::string flags_text;   // what the list shows for the read state ("Read" / "UnRead")
+  uint32_t body_type = 0;   // "BodyType": 1 plain text, 3 HTML (0: not written)
+  int32_t document_id = 0;  // "MessageDocumentId" (code 5)
 };
 
 struct ManifestFolder {
@@ -104,7 +116,7 @@ struct DuplicateRow {
 };
 
 struct StoreManifest {
-  int version = 0;  // 4 Exchange 5.5, 1 Exchange 2000/2003, 2 Exchange 2007
+  int version = 0;  // 4 Exchange 5.5, 1 Exchange 2000/2003, 2 Exchange 2007, 3 2010, 5 2013+
   bool public_store = false;
   uint32_t page_size = 0;
   uint32_t revision = 0;
@@ -121,6 +133,11 @@ struct StoreManifest {
   uint64_t messages = 0;  // distinct keys in "Msg"
   uint64_t attachment_rows = 0;
   bool items_recorded = true;  // false: folders carry counts only
+  // Modern stores: catalog records end at fixed column 12 (later Exchange 2013).
+  bool later_2013_variant = false;
+  // Message rows whose key cannot be read (a "MessageId" of 8 bytes or
+  // fewer); no folder lists them. Key = the whole "MessageId".
+  std::vector<DuplicateRow> unmapped;
 };
 
 // Lower-case hex SHA-256 of `data`.
