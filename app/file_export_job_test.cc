@@ -11,6 +11,7 @@
 #include "base/text.h"
 #include "render/eml_composer.h"
 #include "render/mime/mime_sink.h"
+#include "testing/exchange/modern_store_builder.h"
 #include "testing/exchange/store_builder.h"
 
 namespace tarnwell::app {
@@ -71,12 +72,20 @@ class FileExportTest : public ::testing::TestWithParam<StoreCase> {
   void SetUp() override {
     if (!HavePython()) GTEST_SKIP() << "/usr/bin/python3 is needed to read the export back";
     ASSERT_TRUE(MakeTempDir("tarnwell-export", &dir_).ok());
-    fx::LegacyStoreOptions o;
-    o.version = GetParam().version;
-    o.public_store = GetParam().public_store;
-    o.damage = fx::DamageOptions::All();
     fx::StoreManifest manifest;
-    ASSERT_TRUE(fx::BuildLegacyStore(o, dir_ + "/store.edb", &manifest).ok());
+    if (GetParam().version == fx::kExchange2010 || GetParam().version == fx::kExchange2013) {
+      fx::ModernStoreOptions o;
+      o.version = GetParam().version;
+      o.later_2013_variant = GetParam().version == fx::kExchange2013;
+      o.damage = fx::ModernDamageOptions::All();
+      ASSERT_TRUE(fx::BuildModernStore(o, dir_ + "/store.edb", &manifest).ok());
+    } else {
+      fx::LegacyStoreOptions o;
+      o.version = GetParam().version;
+      o.public_store = GetParam().public_store;
+      o.damage = fx::DamageOptions::All();
+      ASSERT_TRUE(fx::BuildLegacyStore(o, dir_ + "/store.edb", &manifest).ok());
+    }
     manifest_path_ = dir_ + "/manifest.json";
     std::ofstream(manifest_path_) << fx::ManifestJson(manifest);
 
@@ -202,7 +211,9 @@ TEST_P(FileExportTest, DateFilterAndStop) {
 INSTANTIATE_TEST_SUITE_P(Stores, FileExportTest,
                          ::testing::Values(StoreCase{"v55", 4, false}, StoreCase{"v2003", 1, false},
                                            StoreCase{"v2007", 2, false},
-                                           StoreCase{"v2003_public", 1, true}),
+                                           StoreCase{"v2003_public", 1, true},
+                                           StoreCase{"v2010", 3, false},
+                                           StoreCase{"v2013", 5, false}),
                          [](const auto& info) { return std::string(info.param.name); });
 
 TEST(ItemFileNameTest, ForbiddenCharactersCounterAndCuts) {
