@@ -7,6 +7,7 @@
 
 #include "app/job_runner.h"
 #include "base/paths.h"
+#include "testing/exchange/modern_store_builder.h"
 #include "testing/exchange/store_builder.h"
 #include "testing/forge_spec.h"
 #include "testing/ese_writer.h"
@@ -95,6 +96,36 @@ TEST_F(ScanDriverTest, StagesRunInOrderWithTheirTexts) {
     EXPECT_FALSE(running.load());
     EXPECT_GT(tree.count, 0);
   }
+}
+
+TEST(ModernScanDriverTest, MailboxesAndTheirFoldersWithoutAFolderStage) {
+  std::string dir;
+  ASSERT_TRUE(MakeTempDir("tarnwell-app-modern", &dir).ok());
+  fx::ModernStoreOptions options;
+  options.version = fx::kExchange2013;
+  fx::StoreManifest manifest;
+  ASSERT_TRUE(fx::BuildModernStore(options, dir + "/m.edb", &manifest).ok());
+  for (bool mailboxes_only : {false, true}) {
+    RunSettings settings;
+    settings.edb_path = dir + "/m.edb";
+    settings.temp_root = dir + "/temp";
+    settings.version_code = fx::kExchange2013;
+    settings.mailboxes_only = mailboxes_only;
+    Recorder progress;
+    SourceEntry source;
+    ASSERT_TRUE(OpenSource(settings, 1, progress, &source).ok());
+    RunningFlag running{true};
+    CountingTree tree;
+    ASSERT_TRUE(RunScan(source, 1, running, progress, tree).tree_shown);
+    EXPECT_EQ(std::count(progress.stages.begin(), progress.stages.end(),
+                         "Traversing folder table to find folder data"),
+              0);
+    size_t visible = 0;
+    for (const auto& f : manifest.folders) visible += f.visible;
+    EXPECT_EQ(size_t(tree.count),
+              manifest.mailboxes.size() + (mailboxes_only ? 0 : visible));
+  }
+  std::filesystem::remove_all(dir);
 }
 
 TEST_F(ScanDriverTest, OpenFailuresSayWhy) {
