@@ -17,6 +17,7 @@
 
 #include <cstdio>
 #include <cstring>
+#include <iterator>
 #include <memory>
 #include <string>
 #include <vector>
@@ -288,6 +289,31 @@ void WriteCompressed(Corpus* corpus) {
   corpus->Put("compress", "lz4_value", seed(0, 7, forge::EncodeEseLz4Value(ByteView(plain))));
 }
 
+// Composed messages for the MIME parser, and property blobs of both layouts.
+void WriteMessagesAndBlobs(Corpus* corpus) {
+  corpus->Put("mime", "plain",
+              forge::Ascii("From: a@example.com\r\nSubject: =?utf-8?B?w6TDtsO8?=\r\n\r\nbody\r\n"));
+  corpus->Put("mime", "mixed",
+              forge::Ascii("Content-Type: multipart/mixed; boundary=\"b\"\r\n\r\n--b\r\n"
+                           "Content-Transfer-Encoding: quoted-printable\r\n\r\nGr=C3=BC=C3=9Fe\r\n"
+                           "--b\r\nContent-Type: application/octet-stream; name=\"x.bin\"\r\n"
+                           "Content-Transfer-Encoding: base64\r\n\r\nAAECAwQ=\r\n--b--\r\n"));
+  // Documented layout: "ProP", u16, count 2, {kind, id, offset}; 'M' values.
+  Bytes documented = forge::Ascii("ProP");
+  const uint8_t entries[] = {0, 0, 2, 0,  0x48, 0x48, 0x42, 0x00, 24, 0, 0, 0,
+                             0x18, 0x18, 0x07, 0x0E, 1, 0, 0, 0};
+  documented.insert(documented.end(), std::begin(entries), std::end(entries));
+  const uint8_t value[] = {'M', 3, 'a', 'b', 'c'};
+  documented.insert(documented.end(), std::begin(value), std::end(value));
+  corpus->Put("blob", "documented", documented);
+  // Real layout: "ProP", flags 0x0400, count 2, 3-byte entries, values.
+  Bytes real = forge::Ascii("ProP");
+  const uint8_t real_tail[] = {0x00, 0x04, 2, 0,  0x48, 0x1D, 0x0E,  0x18, 0x36, 0x00,
+                               0x4D, 2, 'h', 'i',  0x19, 0x05};
+  real.insert(real.end(), std::begin(real_tail), std::end(real_tail));
+  corpus->Put("blob", "real", real);
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
@@ -299,6 +325,7 @@ int main(int argc, char** argv) {
   WriteDatabases(&corpus);
   WriteRecords(&corpus);
   WriteCompressed(&corpus);
+  WriteMessagesAndBlobs(&corpus);
   std::printf("make_seed_corpus: %zu seeds in %s\n", corpus.written(), argv[1]);
   return corpus.failed() ? 1 : 0;
 }

@@ -315,8 +315,11 @@ std::optional<std::string> CMimeHeader::GetParameter(std::string_view field_name
     if (encoded) rest.remove_suffix(1);
     int index = 0;
     bool digits = !rest.empty() && rest.size() <= 4;
-    for (char c : rest) {
-      if (c < '0' || c > '9') digits = false;
+    for (char c : digits ? rest : std::string_view()) {
+      if (c < '0' || c > '9') {
+        digits = false;
+        break;  // not a section number: no arithmetic on it
+      }
       index = index * 10 + (c - '0');
     }
     if (digits) sections.emplace(index, std::make_pair(encoded, raw));

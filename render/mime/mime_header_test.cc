@@ -347,5 +347,17 @@ TEST(HeaderLoadTest, UnfoldsDecodesAndStopsAtEmptyLine) {
   EXPECT_EQ(header.fields().size(), 4u);
 }
 
+TEST(MimeHeaderParameterTest, HugeSectionNumbersAreNotSections) {
+  // Found by fuzzing: a long run of digits after "name*" overflowed the
+  // section number.
+  CMimeHeader h;
+  const std::string raw =
+      "Content-Type: text/plain; name*99999999999999=\"a\"; name*0=\"b\"\r\n\r\n";
+  h.Load(ByteView(reinterpret_cast<const uint8_t*>(raw.data()), raw.size()));
+  std::optional<std::string> name = h.GetParameter("Content-Type", "name");
+  ASSERT_TRUE(name);
+  EXPECT_EQ(*name, "b");
+}
+
 }  // namespace
 }  // namespace tarnwell::render
