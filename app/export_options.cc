@@ -68,8 +68,8 @@ Status CheckFormatPage(ExportOptions* options, const std::string& folder, std::t
   std::tm t{};
   localtime_r(&now, &t);
   char stamp[64];
-  std::snprintf(stamp, sizeof stamp, "%d_%d_%d_%d_%d_%d", t.tm_mday, t.tm_mon + 1,
-                t.tm_year + 1900, t.tm_hour, t.tm_min, t.tm_sec);
+  std::snprintf(stamp, sizeof stamp, "%d_%d_%d_%d_%d_%d", t.tm_mday, t.tm_mon + 1, t.tm_year + 1900,
+                t.tm_hour, t.tm_min, t.tm_sec);
   options->destination = folder + "/Tarnwell_" + stamp;
   return Status::Ok();
 }

@@ -26,9 +26,9 @@ enum class OutputFormat : uint32_t {
 };
 
 enum class DateMode : uint32_t {
-  kAllTime = 0,   // "All Time"
-  kInside = 1,    // "Save items in selected date range"
-  kExclude = 2,   // "Exclude items in selected date range"
+  kAllTime = 0,  // "All Time"
+  kInside = 1,   // "Save items in selected date range"
+  kExclude = 2,  // "Exclude items in selected date range"
 };
 
 struct CalendarDate {
@@ -43,7 +43,7 @@ struct DateRange {
 };
 
 struct ExportOptions {
-  bool pst_target = false;      // "Save in PST"
+  bool pst_target = false;        // "Save in PST"
   bool office365_target = false;  // "Save in Office 365"
   DateMode date_mode = DateMode::kAllTime;
   std::vector<DateRange> date_ranges;
@@ -86,8 +86,8 @@ Status AddDateRange(std::vector<DateRange>* ranges, const DateRange& range);
 // The filter page's Next: duplicate criteria, then the date ranges.
 Status CheckFilterPage(const ExportOptions& options);
 // The PST page's Next. `split_size_text` is what the size box holds.
-Status CheckPstPage(ExportOptions* options, bool create_new, const std::string& path,
-                    bool split, const std::string& split_size_text, bool gigabytes);
+Status CheckPstPage(ExportOptions* options, bool create_new, const std::string& path, bool split,
+                    const std::string& split_size_text, bool gigabytes);
 // The format page's Next: naming, then the destination folder, which
 // becomes folder + "/Tarnwell_" + the local date and time.
 Status CheckFormatPage(ExportOptions* options, const std::string& folder, std::time_t now);

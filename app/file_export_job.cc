@@ -19,9 +19,9 @@ namespace {
 
 namespace fs = std::filesystem;
 
-constexpr size_t kMaxPathUnits = 256;      // folder path + name, in UTF-16 units
-constexpr size_t kCutMargin = 20;          // what a cut name gives up beyond the overflow
-constexpr size_t kMaxNameBytes = 255;      // one file-name component on Linux
+constexpr size_t kMaxPathUnits = 256;  // folder path + name, in UTF-16 units
+constexpr size_t kCutMargin = 20;      // what a cut name gives up beyond the overflow
+constexpr size_t kMaxNameBytes = 255;  // one file-name component on Linux
 constexpr int kPermille = 1000;
 inline constexpr char kForbidden[] = "\\/:*?\"<>|";
 inline constexpr char kTemporarySuffix[] = ".part";
@@ -238,7 +238,8 @@ Status RunFileExport(store::MailStore& store, const FileExportRequest& request,
         continue;
       }
       store::DecodePurpose purpose;
-      std::optional<store::ItemRecords> item = store.OpenMessage(folder.folder, row.message_key, &purpose);
+      std::optional<store::ItemRecords> item =
+          store.OpenMessage(folder.folder, row.message_key, &purpose);
       if (!item) {
         log.Error("item " + std::to_string(counter) + " of " + tree_path +
                   " has no message record\r\n");
@@ -281,14 +282,13 @@ Status RunFileExport(store::MailStore& store, const FileExportRequest& request,
           return out->ok() ? Status::Ok() : Status::IoError("write failed");
         }
         if (!native.empty()) {
-          return render::ComposeCarrier(
-              kind == ItemKind::kContact ? "text/vcard" : "text/calendar",
-              std::to_string(counter) + native_extension, native, date, attachments, headers,
-              compose, out);
+          return render::ComposeCarrier(kind == ItemKind::kContact ? "text/vcard" : "text/calendar",
+                                        std::to_string(counter) + native_extension, native, date,
+                                        attachments, headers, compose, out);
         }
         if (kind == ItemKind::kTask) {
-          return render::ComposeTask(item->task, item->message.rtf_body, date, attachments,
-                                     headers, compose, out);
+          return render::ComposeTask(item->task, item->message.rtf_body, date, attachments, headers,
+                                     compose, out);
         }
         return render::ComposeMessage(item->message, date, attachments, headers, compose, out);
       };

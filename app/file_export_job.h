@@ -22,8 +22,8 @@
 namespace tarnwell::app {
 
 struct ExportFolder {
-  store::FolderRef folder;         // the folder in its store
-  std::vector<std::string> path;   // names from the source's top item down
+  store::FolderRef folder;        // the folder in its store
+  std::vector<std::string> path;  // names from the source's top item down
 };
 
 struct FileExportRequest {
@@ -31,10 +31,10 @@ struct FileExportRequest {
   std::vector<ExportFolder> folders;  // the checked folders, depth-first
   std::string source_path;
   bool keep_native = false;
-  bool store_text = true;             // "Support Non English characters"
+  bool store_text = true;  // "Support Non English characters"
   uint32_t ansi_code_page = 1252;
-  std::string log_dir;                // empty: the desktop folder
-  std::time_t now = 0;                // 0: the clock
+  std::string log_dir;  // empty: the desktop folder
+  std::time_t now = 0;  // 0: the clock
 };
 
 struct FolderResult {

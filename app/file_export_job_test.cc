@@ -27,8 +27,8 @@ bool HavePython() { return std::system("/usr/bin/python3 -c 'import email' 2>/de
 // Runs the independent check; its report goes into the failure message.
 void CheckExport(const std::string& manifest, const std::string& dir, const std::string& mode) {
   const std::string report = dir + ".report";
-  const std::string cmd = "/usr/bin/python3 '" + kChecker + "' '" + manifest + "' '" + dir +
-                          "' " + mode + " > '" + report + "' 2>&1";
+  const std::string cmd = "/usr/bin/python3 '" + kChecker + "' '" + manifest + "' '" + dir + "' " +
+                          mode + " > '" + report + "' 2>&1";
   const int rc = std::system(cmd.c_str());
   std::ifstream in(report);
   const std::string text((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
@@ -133,8 +133,8 @@ TEST_P(FileExportTest, EmlMboxAndNativeFilesReadBackAsTheManifestSays) {
   // Every folder logged what it found and saved.
   std::ifstream log(native.log_path, std::ios::binary);
   const std::string raw((std::istreambuf_iterator<char>(log)), std::istreambuf_iterator<char>());
-  const std::string text = Utf16LEToUtf8(ByteView(reinterpret_cast<const uint8_t*>(raw.data()) + 2,
-                                                  raw.size() - 2));
+  const std::string text =
+      Utf16LEToUtf8(ByteView(reinterpret_cast<const uint8_t*>(raw.data()) + 2, raw.size() - 2));
   EXPECT_NE(text.find("Save Items as:\tEML\t\r\n"), std::string::npos);
   EXPECT_NE(text.find("Items Found: "), std::string::npos);
   EXPECT_NE(text.find("Save Process Completed Successfully"), std::string::npos);
@@ -195,8 +195,8 @@ TEST_P(FileExportTest, DateFilterAndStop) {
   EXPECT_TRUE(stopped.stopped);
   std::ifstream log(stopped.log_path, std::ios::binary);
   const std::string raw((std::istreambuf_iterator<char>(log)), std::istreambuf_iterator<char>());
-  const std::string text = Utf16LEToUtf8(ByteView(reinterpret_cast<const uint8_t*>(raw.data()) + 2,
-                                                  raw.size() - 2));
+  const std::string text =
+      Utf16LEToUtf8(ByteView(reinterpret_cast<const uint8_t*>(raw.data()) + 2, raw.size() - 2));
   size_t saved_lines = 0;
   for (size_t at = text.find("Items Saved: "); at != std::string::npos;
        at = text.find("Items Saved: ", at + 1)) {

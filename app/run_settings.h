@@ -19,10 +19,10 @@ struct RunSettings {
   std::string stm_path;
   std::string template_path;
   std::string snapshot_path;
-  std::string temp_root;     // the temporary folder chosen by the user
-  int version_code = 0;      // the StoreVersion
+  std::string temp_root;  // the temporary folder chosen by the user
+  int version_code = 0;   // the StoreVersion
   store::ScanMode mode = store::ScanMode::kStandard;
-  uint32_t non_english = 1;  // "Support Non English characters"
+  uint32_t non_english = 1;       // "Support Non English characters"
   uint32_t adjustment_check = 0;  // runs "Checking Adjustment Factor"
   bool load_snapshot = false;
   bool mailboxes_only = false;  // modern stores: show the mailboxes, load them when used
@@ -36,7 +36,7 @@ struct SourceEntry {
   store::ScanMode mode = store::ScanMode::kStandard;
   uint32_t non_english = 1;
   std::string edb_path;
-  std::string work_folder;  // temp root + source number
+  std::string work_folder;      // temp root + source number
   bool mailboxes_only = false;  // modern stores: load no mailbox during the scan
   std::unique_ptr<engine::EdbClass> reader;
   std::unique_ptr<store::MailStore> store;

@@ -35,12 +35,9 @@ struct StageTexts {
 };
 
 constexpr StageTexts kStandardTexts = {
-    "Traversing mailBox table",
-    "Traversing folder table to find folder data",
-    "Creating Internal tree Structure",
-    "Showing Data in tree control",
-    "Creating msg map from msg table",
-    "Creating Attachment map from Attachment table",
+    "Traversing mailBox table",         "Traversing folder table to find folder data",
+    "Creating Internal tree Structure", "Showing Data in tree control",
+    "Creating msg map from msg table",  "Creating Attachment map from Attachment table",
 };
 
 constexpr StageTexts kAdvanceTexts = {
@@ -127,8 +124,8 @@ ScanOutcome RunScan(SourceEntry& source, uint64_t source_number, RunningFlag& ru
     }
   }
 
-  const bool modern = source.version_code == engine::kExchange2010 ||
-                      source.version_code == engine::kExchange2013;
+  const bool modern =
+      source.version_code == engine::kExchange2010 || source.version_code == engine::kExchange2013;
   if (modern) {
     auto s = std::make_unique<store::ModernStore>(reader, source.version_code, source.mode);
     s->SetWorkFolder(source.work_folder);

@@ -7,10 +7,10 @@
 
 #include "app/job_runner.h"
 #include "base/paths.h"
+#include "testing/ese_writer.h"
 #include "testing/exchange/modern_store_builder.h"
 #include "testing/exchange/store_builder.h"
 #include "testing/forge_spec.h"
-#include "testing/ese_writer.h"
 
 namespace tarnwell::app {
 namespace {
@@ -57,28 +57,26 @@ class ScanDriverTest : public ::testing::Test {
 };
 
 TEST_F(ScanDriverTest, StagesRunInOrderWithTheirTexts) {
-  const std::vector<std::string> standard = {
-      "Reading Catalog",
-      "Traversing record",
-      "Finding Table names",
-      "Traversing mailBox table",
-      "Traversing folder table to find folder data",
-      "Creating Internal tree Structure",
-      "Showing Data in tree control",
-      "Creating msg map from msg table",
-      "Creating Attachment map from Attachment table"};
-  const std::vector<std::string> advance = {
-      "Checking Adjustment Factor",
-      "Finding Pages in File",
-      "Reading Catalog for Leaf Pages",
-      "Traversing record Vector",
-      "Collecting Table Names",
-      "Finding Users",
-      "Traversing Folder Table to find folder data",
-      "Creating internal tree structure",
-      "Showing Data in tree control",
-      "Creating Msg map from msg Table",
-      "Creating Attachment Map from attachment table"};
+  const std::vector<std::string> standard = {"Reading Catalog",
+                                             "Traversing record",
+                                             "Finding Table names",
+                                             "Traversing mailBox table",
+                                             "Traversing folder table to find folder data",
+                                             "Creating Internal tree Structure",
+                                             "Showing Data in tree control",
+                                             "Creating msg map from msg table",
+                                             "Creating Attachment map from Attachment table"};
+  const std::vector<std::string> advance = {"Checking Adjustment Factor",
+                                            "Finding Pages in File",
+                                            "Reading Catalog for Leaf Pages",
+                                            "Traversing record Vector",
+                                            "Collecting Table Names",
+                                            "Finding Users",
+                                            "Traversing Folder Table to find folder data",
+                                            "Creating internal tree structure",
+                                            "Showing Data in tree control",
+                                            "Creating Msg map from msg Table",
+                                            "Creating Attachment Map from attachment table"};
   for (auto [mode, want] : {std::pair{store::ScanMode::kStandard, standard},
                             std::pair{store::ScanMode::kAdvance, advance}}) {
     RunSettings settings = Settings(mode);
@@ -122,8 +120,7 @@ TEST(ModernScanDriverTest, MailboxesAndTheirFoldersWithoutAFolderStage) {
               0);
     size_t visible = 0;
     for (const auto& f : manifest.folders) visible += f.visible;
-    EXPECT_EQ(size_t(tree.count),
-              manifest.mailboxes.size() + (mailboxes_only ? 0 : visible));
+    EXPECT_EQ(size_t(tree.count), manifest.mailboxes.size() + (mailboxes_only ? 0 : visible));
   }
   std::filesystem::remove_all(dir);
 }

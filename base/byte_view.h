@@ -59,9 +59,7 @@ class ByteView {
   uint8_t operator[](size_t i) const { return data_[i]; }  // caller checks i < size()
 
   // True when [offset, offset + width) lies inside the view; overflow-safe.
-  bool Has(size_t offset, size_t width) const {
-    return offset <= size_ && width <= size_ - offset;
-  }
+  bool Has(size_t offset, size_t width) const { return offset <= size_ && width <= size_ - offset; }
 
   // A sub-view; empty when the range does not lie wholly inside this view.
   ByteView Sub(size_t offset, size_t length) const {

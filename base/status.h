@@ -10,7 +10,15 @@ namespace tarnwell {
 
 class Status {
  public:
-  enum class Code { kOk, kNotFound, kCorruption, kIoError, kInvalidArgument, kNotSupported, kCancelled };
+  enum class Code {
+    kOk,
+    kNotFound,
+    kCorruption,
+    kIoError,
+    kInvalidArgument,
+    kNotSupported,
+    kCancelled
+  };
 
   Status() = default;
   static Status Ok() { return Status(); }

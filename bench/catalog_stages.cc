@@ -38,7 +38,8 @@ int main(int argc, char** argv) {
   auto t = Clock::now();
   if (advance) {
     reader->ScanLeafPages();
-    std::printf("Finding Pages in File\t%.6f\t%zu pages\n", Seconds(t), reader->leaf_pages().size());
+    std::printf("Finding Pages in File\t%.6f\t%zu pages\n", Seconds(t),
+                reader->leaf_pages().size());
     t = Clock::now();
     reader->CollectLeafPageRecords();
     std::printf("Reading Catalog for Leaf Pages\t%.6f\t%zu records\n", Seconds(t),

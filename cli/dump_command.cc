@@ -111,32 +111,32 @@ Status DumpTable(engine::EdbClass& reader, const std::string& table_name, bool j
   }
 
   uint64_t count = 0;
-  const int walked = reader.ForEachRecord(*table, [&](const engine::RecordRef&,
-                                                      engine::RecordColumns& columns) {
-    std::string text;
-    if (json) {
-      JsonWriter w;
-      w.BeginObject();
-      for (size_t i = 0; i < table->columns.size(); ++i) {
-        engine::DecodedColumn d = decoder.Decode(table->columns[i], columns.at(i));
-        if (d.kind == Kind::kAbsent) continue;
-        w.Key(table->columns[i].name);
-        WriteJsonValue(w, d);
-      }
-      w.EndObject();
-      text = (count ? "," : "") + w.str() + "\n";
-    } else {
-      text = fmt::format("Record {}\n", count + 1);
-      for (size_t i = 0; i < table->columns.size(); ++i) {
-        engine::DecodedColumn d = decoder.Decode(table->columns[i], columns.at(i));
-        if (d.kind == Kind::kAbsent) continue;
-        text += fmt::format("  {}: {}\n", table->columns[i].name, TextValue(d));
-      }
-    }
-    std::fwrite(text.data(), 1, text.size(), out);
-    ++count;
-    return true;
-  });
+  const int walked =
+      reader.ForEachRecord(*table, [&](const engine::RecordRef&, engine::RecordColumns& columns) {
+        std::string text;
+        if (json) {
+          JsonWriter w;
+          w.BeginObject();
+          for (size_t i = 0; i < table->columns.size(); ++i) {
+            engine::DecodedColumn d = decoder.Decode(table->columns[i], columns.at(i));
+            if (d.kind == Kind::kAbsent) continue;
+            w.Key(table->columns[i].name);
+            WriteJsonValue(w, d);
+          }
+          w.EndObject();
+          text = (count ? "," : "") + w.str() + "\n";
+        } else {
+          text = fmt::format("Record {}\n", count + 1);
+          for (size_t i = 0; i < table->columns.size(); ++i) {
+            engine::DecodedColumn d = decoder.Decode(table->columns[i], columns.at(i));
+            if (d.kind == Kind::kAbsent) continue;
+            text += fmt::format("  {}: {}\n", table->columns[i].name, TextValue(d));
+          }
+        }
+        std::fwrite(text.data(), 1, text.size(), out);
+        ++count;
+        return true;
+      });
   if (json) std::fputs("]}\n", out);
   if (walked != 1) return Status::Corruption("the table's tree could not be walked whole");
   return Status::Ok();

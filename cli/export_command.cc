@@ -28,7 +28,8 @@ Status ParseSwitches(const std::string& text, const std::vector<std::string>& na
     for (size_t i = 0; i < names.size(); ++i) {
       if (item == names[i]) flags[i] = known = true;
     }
-    if (!known) return Status::InvalidArgument("unknown " + std::string(what) + " \"" + item + "\"");
+    if (!known)
+      return Status::InvalidArgument("unknown " + std::string(what) + " \"" + item + "\"");
   }
   return Status::Ok();
 }
@@ -63,7 +64,8 @@ Status RunExport(const ExportCommandOptions& o, ProgressSink& progress, ExportSu
     app::DateRange r;
     if (dots == std::string::npos || !ParseDate(range.substr(0, dots), &r.start) ||
         !ParseDate(range.substr(dots + 2), &r.end)) {
-      return Status::InvalidArgument("a date range is written START..END, as 2021-01-31..2021-12-31");
+      return Status::InvalidArgument(
+          "a date range is written START..END, as 2021-01-31..2021-12-31");
     }
     Status s = app::AddDateRange(&options.date_ranges, r);
     if (!s.ok()) return s;
@@ -74,8 +76,7 @@ Status RunExport(const ExportCommandOptions& o, ProgressSink& progress, ExportSu
   Status s = app::CheckFilterPage(options);
   if (!s.ok()) return s;
   // The format page.
-  s = ParseSwitches(o.name_by, {"to", "from", "subject", "date"}, options.name_by,
-                    "naming part");
+  s = ParseSwitches(o.name_by, {"to", "from", "subject", "date"}, options.name_by, "naming part");
   if (!s.ok()) return s;
   options.keep_hierarchy = o.hierarchy;
   s = app::CheckFormatPage(&options, o.out, std::time(nullptr));

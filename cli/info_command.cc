@@ -59,8 +59,8 @@ std::string FormatInfoText(const DatabaseInfo& i) {
   out += fmt::format("Adjustment factor:  {}\n", i.adjustment);
   out += fmt::format("Total pages:        {}\n", i.total_pages);
   out += fmt::format("Leaf pages:         {}\n", i.leaf_pages);
-  out += fmt::format("State:              {} ({})\n", i.state_name,
-                     i.state == 3 ? "clean" : "dirty");
+  out +=
+      fmt::format("State:              {} ({})\n", i.state_name, i.state == 3 ? "clean" : "dirty");
   if (!i.warning.empty()) out += fmt::format("Note:               {}\n", i.warning);
   return out;
 }

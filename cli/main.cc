@@ -34,8 +34,8 @@ int RunTables(const std::string& path, bool json) {
     std::fprintf(stderr, "tarnwell: %s: %s\n", path.c_str(), s.ToString().c_str());
     return 1;
   }
-  const std::string out = json ? tarnwell::cli::FormatTablesJson(*reader)
-                               : tarnwell::cli::FormatTablesText(*reader);
+  const std::string out =
+      json ? tarnwell::cli::FormatTablesJson(*reader) : tarnwell::cli::FormatTablesText(*reader);
   std::fwrite(out.data(), 1, out.size(), stdout);
   return 0;
 }
@@ -114,7 +114,8 @@ int main(int argc, char** argv) {
 
   std::string tables_path;
   bool tables_json = false;
-  CLI::App* tables = app.add_subcommand("tables", "List the tables of a database and their columns");
+  CLI::App* tables =
+      app.add_subcommand("tables", "List the tables of a database and their columns");
   tables->add_option("DB", tables_path, "database file")->required();
   tables->add_flag("--json", tables_json, "print JSON");
 
@@ -147,15 +148,23 @@ int main(int argc, char** argv) {
   AddScanOptions(exp, &export_options.scan);
   exp->add_option("--to", export_options.to, "eml or mbox")->required();
   exp->add_option("--out", export_options.out, "destination folder")->required();
-  exp->add_option("--folder", export_options.folders, "folder reference (repeatable; default: all)");
-  exp->add_flag("--hierarchy", export_options.hierarchy, "recreate the folder tree below the destination");
+  exp->add_option("--folder", export_options.folders,
+                  "folder reference (repeatable; default: all)");
+  exp->add_flag("--hierarchy", export_options.hierarchy,
+                "recreate the folder tree below the destination");
   exp->add_option("--name-by", export_options.name_by, "file name parts: to,from,subject,date");
-  exp->add_option("--date-range", export_options.date_ranges, "START..END, as 2021-01-31..2021-12-31 (repeatable)");
-  exp->add_flag("--exclude-ranges", export_options.exclude_ranges, "export the items outside the ranges");
-  exp->add_option("--dedup", export_options.dedup, "remove duplicates by: to,from,subject,created,modified,arrival");
-  exp->add_flag("--keep-native", export_options.keep_native, "contacts as .vcf and appointments as .ics");
-  exp->add_option("--ansi-codepage", export_options.ansi_code_page, "header texts in this Windows code page instead of UTF-8");
-  exp->add_option("--log-dir", export_options.log_dir, "folder of the export log (default: the desktop)");
+  exp->add_option("--date-range", export_options.date_ranges,
+                  "START..END, as 2021-01-31..2021-12-31 (repeatable)");
+  exp->add_flag("--exclude-ranges", export_options.exclude_ranges,
+                "export the items outside the ranges");
+  exp->add_option("--dedup", export_options.dedup,
+                  "remove duplicates by: to,from,subject,created,modified,arrival");
+  exp->add_flag("--keep-native", export_options.keep_native,
+                "contacts as .vcf and appointments as .ics");
+  exp->add_option("--ansi-codepage", export_options.ansi_code_page,
+                  "header texts in this Windows code page instead of UTF-8");
+  exp->add_option("--log-dir", export_options.log_dir,
+                  "folder of the export log (default: the desktop)");
 
   CLI11_PARSE(app, argc, argv);
   if (exp->parsed()) return RunExportCommand(export_options);

@@ -1,8 +1,7 @@
 #include "cli/store_commands.h"
 
-#include <openssl/evp.h>
-
 #include <fmt/format.h>
+#include <openssl/evp.h>
 
 #include "base/date_time.h"
 #include "base/json_writer.h"
@@ -285,10 +284,11 @@ Status RunShow(StoreSession& session, const std::string& ref, size_t item, bool 
     *out = w.str() + "\n";
   } else {
     // The text form is the same content, one field per line.
-    *out = fmt::format("Folder:   {}\nKind:     {}\nClass:    {}\nSubject:  {}\nFrom:     {}\n"
-                       "To:       {}\nCreated:  {}\nReceived: {}\n",
-                       PathText(folder->path), PurposeName(purpose), list.type, list.subject,
-                       list.from, list.to, list.created, list.arrival);
+    *out = fmt::format(
+        "Folder:   {}\nKind:     {}\nClass:    {}\nSubject:  {}\nFrom:     {}\n"
+        "To:       {}\nCreated:  {}\nReceived: {}\n",
+        PathText(folder->path), PurposeName(purpose), list.type, list.subject, list.from, list.to,
+        list.created, list.arrival);
     for (const store::AttachmentRecord& a : attachments) {
       *out += fmt::format("Attachment: {} ({} bytes, sha256 {})\n", a.name, a.data.size(),
                           Sha256Hex(ByteView(a.data)));

@@ -75,10 +75,10 @@ TEST_P(StoreCommandsTest, ShiftedFilesScanLikeTheWholeFileWithAdjust) {
   }
 }
 
-INSTANTIATE_TEST_SUITE_P(
-    Files, StoreCommandsTest,
-    ::testing::Combine(::testing::Values(Shift::kNone, Shift::kJunk512, Shift::kNoHeaders),
-                       ::testing::Values("standard", "advance")));
+INSTANTIATE_TEST_SUITE_P(Files, StoreCommandsTest,
+                         ::testing::Combine(::testing::Values(Shift::kNone, Shift::kJunk512,
+                                                              Shift::kNoHeaders),
+                                            ::testing::Values("standard", "advance")));
 
 TEST(StoreCommandErrorsTest, ClearErrors) {
   int code = 0;

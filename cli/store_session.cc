@@ -1,9 +1,9 @@
 #include "cli/store_session.h"
 
+#include <fmt/format.h>
+
 #include <filesystem>
 #include <map>
-
-#include <fmt/format.h>
 
 #include "base/paths.h"
 #include "engine/version.h"
@@ -119,7 +119,8 @@ Status StoreSession::Open(const ScanOptions& options, ProgressSink& progress) {
   settings_.stm_path = options.stm;
   settings_.temp_root = temp_root_;
   settings_.version_code = code;
-  settings_.mode = options.mode == "advance" ? store::ScanMode::kAdvance : store::ScanMode::kStandard;
+  settings_.mode =
+      options.mode == "advance" ? store::ScanMode::kAdvance : store::ScanMode::kStandard;
   settings_.adjustment_check = options.adjust ? 1 : 0;
   settings_.mailboxes_only = options.mailboxes_only;
   constexpr uint64_t kSourceNumber = 1;

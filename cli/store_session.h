@@ -16,12 +16,12 @@ namespace tarnwell::cli {
 
 struct ScanOptions {
   std::string db;
-  std::string version = "auto";  // auto|5.5|2000|2003|2007|2010|2013
-  std::string mode = "standard"; // standard|advance
+  std::string version = "auto";   // auto|5.5|2000|2003|2007|2010|2013
+  std::string mode = "standard";  // standard|advance
   std::string stm;
-  std::string temp;              // empty: a fresh folder, removed at the end
+  std::string temp;  // empty: a fresh folder, removed at the end
   bool adjust = false;
-  bool mailboxes_only = false;   // modern stores: load mailboxes only when used
+  bool mailboxes_only = false;  // modern stores: load mailboxes only when used
 };
 
 struct ShownFolder {
@@ -29,7 +29,7 @@ struct ShownFolder {
   std::vector<std::string> path;  // names from the source's top item down
   store::FolderRef folder;        // the folder in its store
   int icon = 0;
-  int parent = -1;                // position of the parent in the shown list; -1: the top item
+  int parent = -1;  // position of the parent in the shown list; -1: the top item
 };
 
 // Parses "auto", "5.5", "2000", ... into a version code; auto reads the

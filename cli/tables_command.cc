@@ -24,9 +24,9 @@ Status OpenWithCatalog(const std::string& path, ProgressSink& progress,
 
 std::string ColumnTypeName(uint32_t type) {
   static const char* const kNames[] = {
-      "nil",      "bit",       "unsigned byte", "short",       "long",        "currency",
-      "float",    "double",    "date time",     "binary",      "text",        "long binary",
-      "long text", "slv",      "unsigned long", "long long",   "guid",        "unsigned short"};
+      "nil",       "bit",    "unsigned byte", "short",     "long", "currency",
+      "float",     "double", "date time",     "binary",    "text", "long binary",
+      "long text", "slv",    "unsigned long", "long long", "guid", "unsigned short"};
   if (type < sizeof kNames / sizeof kNames[0]) return kNames[type];
   return "type " + std::to_string(type);
 }

@@ -34,8 +34,8 @@ void FindAdjustmentFactor(PageFile& file, uint32_t root_flags, uint32_t space_fl
   Bytes window(kProbeWindow, 0);
   const size_t got = file.ReadAt(int64_t(file.base_offset()), window.data(), window.size());
   window.resize(got);  // bytes past the end of the file match nothing
-  std::optional<int64_t> a = ProbeAdjustment(ByteView(window), file.page_size(), root_flags,
-                                             space_flags);
+  std::optional<int64_t> a =
+      ProbeAdjustment(ByteView(window), file.page_size(), root_flags, space_flags);
   if (a) file.SetAdjustment(*a);
 }
 

@@ -19,7 +19,7 @@
 
 namespace tarnwell::engine {
 
-constexpr size_t kProbeWindow = 0x500000;     // bytes read from the base offset
+constexpr size_t kProbeWindow = 0x500000;        // bytes read from the base offset
 constexpr size_t kProbeLastPosition = 0x4FD000;  // positions tried: [0, this)
 
 // Searches `window` (the first bytes of the database) for the database start.

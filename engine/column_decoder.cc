@@ -83,8 +83,8 @@ DecodedColumn ColumnDecoder::Decode(const CatalogEntry& column, const ColumnValu
     for (size_t k = 0; k < count; ++k) {
       const uint16_t word = bytes.U16LE(2 * k);
       const size_t begin = word & kMultiOffsetMask;
-      const size_t end = k + 1 < count ? (bytes.U16LE(2 * (k + 1)) & kMultiOffsetMask)
-                                       : bytes.size();
+      const size_t end =
+          k + 1 < count ? (bytes.U16LE(2 * (k + 1)) & kMultiOffsetMask) : bytes.size();
       if (begin > end || end > bytes.size()) {
         multi.values.push_back(Damaged("multi-valued element outside the value"));
         break;
@@ -123,8 +123,10 @@ DecodedColumn ColumnDecoder::DecodeElement(const CatalogEntry& column, ByteView 
     if (!d.ok()) return Damaged("compressed value: " + d.message, ByteView(d.bytes));
     owned = std::move(d.bytes);
     bytes = ByteView(owned);
-    if (d.is_utf16) utf16 = true;
-    else if (d.scheme == CompressionScheme::kSevenBitAscii) utf16 = false;
+    if (d.is_utf16)
+      utf16 = true;
+    else if (d.scheme == CompressionScheme::kSevenBitAscii)
+      utf16 = false;
   }
   return Interpret(column, bytes, utf16);
 }
@@ -164,7 +166,9 @@ DecodedColumn ColumnDecoder::Interpret(const CatalogEntry& column, ByteView b, b
     case kColumnLong:
     case kColumnCurrency:
     case kColumnLongLong: {
-      const size_t w = column.column_type() == kColumnShort ? 2 : column.column_type() == kColumnLong ? 4 : 8;
+      const size_t w = column.column_type() == kColumnShort  ? 2
+                       : column.column_type() == kColumnLong ? 4
+                                                             : 8;
       if (!fixed(w)) return d;
       d.kind = DecodedColumn::Kind::kSigned;
       d.i = SignExtend(little(w), w);
@@ -201,8 +205,8 @@ DecodedColumn ColumnDecoder::Interpret(const CatalogEntry& column, ByteView b, b
     case kColumnLongText:
       d.kind = DecodedColumn::Kind::kText;
       // A terminating NUL is not part of the text.
-      d.text = utf16 ? Utf16LEToUtf8(b) : CodePageToUtf8(b, column.code_page ? column.code_page
-                                                                              : kDefaultCodePage);
+      d.text = utf16 ? Utf16LEToUtf8(b)
+                     : CodePageToUtf8(b, column.code_page ? column.code_page : kDefaultCodePage);
       while (!d.text.empty() && d.text.back() == '\0') d.text.pop_back();
       return d;
     default:

@@ -73,10 +73,10 @@ struct ColumnValue {
   bool filled = false;   // the column has a slot value (its type is known)
   bool present = false;  // the record stores bytes for it
   uint8_t type_code = kTypeNone;
-  ByteView value;        // points into the record's storage
+  ByteView value;  // points into the record's storage
   uint8_t flag_byte = 0;
   bool has_flag_byte = false;
-  char byte_order = 0;   // 'l', 'b', 'n', or 0 for variable values
+  char byte_order = 0;  // 'l', 'b', 'n', or 0 for variable values
   uint32_t code_page = 0;
   uint8_t marker = kColumnValueMarker;
 };

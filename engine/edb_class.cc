@@ -2,9 +2,9 @@
 
 #include "engine/adjustment_probe.h"
 #include "engine/catalog.h"
+#include "engine/edb2010_class.h"
 #include "engine/leaf_harvest.h"
 #include "engine/tree_walk.h"
-#include "engine/edb2010_class.h"
 
 namespace tarnwell::engine {
 
@@ -267,8 +267,7 @@ RecordRef EdbClass::MakeRecordRef(uint32_t page_number, uint16_t tag) const {
 
 TaggedForm EdbClass::tagged_form() const {
   if (version_ == kExchange55) return TaggedForm::kInline;
-  return family() == PageFamily::kLarge ? TaggedForm::kLargePageArray
-                                        : TaggedForm::kSmallPageArray;
+  return family() == PageFamily::kLarge ? TaggedForm::kLargePageArray : TaggedForm::kSmallPageArray;
 }
 
 int EdbClass::ReadRecordColumns(const RecordRef& ref, const TableDef& table,

@@ -121,8 +121,8 @@ class EdbClass {
   RecordRef MakeRecordRef(uint32_t page_number, uint16_t tag) const;
   // Splits the record `ref` points to by the columns of `table` (after those
   // of `template_table` when given). 0 done; -1 when `ref` is no record.
-  int ReadRecordColumns(const RecordRef& ref, const TableDef& table,
-                        const TableDef* template_table, RecordColumns* out) const;
+  int ReadRecordColumns(const RecordRef& ref, const TableDef& table, const TableDef* template_table,
+                        RecordColumns* out) const;
 
   // Walks the tree of `table` and splits each of its records. The visitor
   // returns false to stop. 1 walked, 0 the root could not be walked.

@@ -21,8 +21,8 @@ bool IsLeafDataPage(uint32_t flags) {
          !(flags & kPageFlagLongValue);
 }
 
-std::vector<LeafPageEntry> ScanLeafPages(const PageFile& file, uint64_t skip,
-                                         RunningFlag& running, ProgressSink& progress) {
+std::vector<LeafPageEntry> ScanLeafPages(const PageFile& file, uint64_t skip, RunningFlag& running,
+                                         ProgressSink& progress) {
   std::vector<LeafPageEntry> pages;
   progress.Range(0, kPermille);
   progress.Position(0);

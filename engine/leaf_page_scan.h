@@ -28,8 +28,8 @@ bool IsLeafDataPage(uint32_t flags);
 // Positions before page 1 (the header blocks, or bytes a negative adjustment
 // puts before the file) are not pages and are stepped over. When `running`
 // drops, the scan raises it again and returns what it found so far.
-std::vector<LeafPageEntry> ScanLeafPages(const PageFile& file, uint64_t skip,
-                                         RunningFlag& running, ProgressSink& progress);
+std::vector<LeafPageEntry> ScanLeafPages(const PageFile& file, uint64_t skip, RunningFlag& running,
+                                         ProgressSink& progress);
 
 }  // namespace tarnwell::engine
 

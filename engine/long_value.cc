@@ -70,7 +70,7 @@ int LongValueReader::Collect(uint32_t root_page, ByteView id, LongValue* out,
     const Found& f = found[i];
     if (f.offset != out->total_size) {
       if (f.offset < out->total_size) continue;  // overlaps what we have
-      out->truncated = true;                      // a chunk is missing
+      out->truncated = true;                     // a chunk is missing
       break;
     }
     // The logical bytes this chunk should cover: up to the next chunk, or

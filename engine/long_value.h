@@ -46,7 +46,7 @@ struct LongValue {
   uint64_t declared_size = 0;  // from the root node; 0 when unknown
   uint64_t total_size = 0;     // logical bytes assembled
   std::vector<LongValueChunk> chunks;
-  bool truncated = false;      // a chunk was missing: the value ends early
+  bool truncated = false;  // a chunk was missing: the value ends early
 };
 
 class LongValueReader {

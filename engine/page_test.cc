@@ -18,8 +18,8 @@ Bytes MakePage(PageFamily family, size_t page_size, uint32_t page_flags,
   Bytes page(page_size, 0);
   const size_t header = PageHeaderSize(family);
   StoreU32LE(page.data() + kPageFlagsOffset, page_flags);
-  const uint16_t count = tag_count_override >= 0 ? uint16_t(tag_count_override)
-                                                 : uint16_t(nodes.size());
+  const uint16_t count =
+      tag_count_override >= 0 ? uint16_t(tag_count_override) : uint16_t(nodes.size());
   StoreU16LE(page.data() + kPageTagCountOffset, count);
   size_t offset = 0;
   for (size_t i = 0; i < nodes.size(); ++i) {
@@ -55,12 +55,12 @@ class PageFamilyTest : public ::testing::TestWithParam<std::pair<PageFamily, siz
 TEST_P(PageFamilyTest, DecodesKeysPrefixesAndDeletedNodes) {
   const auto [family, page_size] = GetParam();
   std::vector<RawNode> nodes = {
-      {Bytes{0x7F, 0x10, 0x20, 0x30}, 0},                          // external header: prefix
-      {Node({0x01, 0x02}, {0xAA, 0xBB}), 0},                       // plain key
-      {Node({0x40}, {0xCC}, 3), kNodeFlagPrefix},                  // prefix 7F 10 20 + 40
-      {Node({0x50}, {0xDD}, 0), kNodeFlagPrefix},                  // L = 0: suffix alone
-      {Node({0x60}, {0xEE}), kNodeFlagDeleted},                    // deleted
-      {Node({0x70}, {0xFF}, 9), kNodeFlagPrefix},                  // prefix longer than tag 0
+      {Bytes{0x7F, 0x10, 0x20, 0x30}, 0},          // external header: prefix
+      {Node({0x01, 0x02}, {0xAA, 0xBB}), 0},       // plain key
+      {Node({0x40}, {0xCC}, 3), kNodeFlagPrefix},  // prefix 7F 10 20 + 40
+      {Node({0x50}, {0xDD}, 0), kNodeFlagPrefix},  // L = 0: suffix alone
+      {Node({0x60}, {0xEE}), kNodeFlagDeleted},    // deleted
+      {Node({0x70}, {0xFF}, 9), kNodeFlagPrefix},  // prefix longer than tag 0
   };
   Page page(MakePage(family, page_size, kPageFlagLeaf, nodes), family);
   ASSERT_EQ(page.nodes().size(), 6u);

@@ -111,7 +111,8 @@ TEST_P(RealFileTest, EveryTableDumpsWithoutDamage) {
     EXPECT_EQ(reader->ForEachRecord(t,
                                     [&](const RecordRef&, RecordColumns& columns) {
                                       for (size_t i = 0; i < t.columns.size(); ++i) {
-                                        DecodedColumn d = decoder.Decode(t.columns[i], columns.at(i));
+                                        DecodedColumn d =
+                                            decoder.Decode(t.columns[i], columns.at(i));
                                         if (d.kind == DecodedColumn::Kind::kDamaged) {
                                           ADD_FAILURE() << t.name() << "." << t.columns[i].name
                                                         << ": " << d.text;
@@ -286,14 +287,13 @@ TEST_P(RealFileTest, AgreesWithEsedbexport) {
   EXPECT_GT(compared, 0u);
 }
 
-INSTANTIATE_TEST_SUITE_P(External, RealFileTest, ::testing::ValuesIn(kFiles),
-                         [](const auto& info) {
-                           std::string name = fs::path(info.param.path).stem().string();
-                           for (char& c : name) {
-                             if (!std::isalnum(static_cast<unsigned char>(c))) c = '_';
-                           }
-                           return name;
-                         });
+INSTANTIATE_TEST_SUITE_P(External, RealFileTest, ::testing::ValuesIn(kFiles), [](const auto& info) {
+  std::string name = fs::path(info.param.path).stem().string();
+  for (char& c : name) {
+    if (!std::isalnum(static_cast<unsigned char>(c))) c = '_';
+  }
+  return name;
+});
 
 }  // namespace
 }  // namespace tarnwell::engine

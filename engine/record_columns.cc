@@ -128,7 +128,8 @@ bool RecordColumns::Split(ByteView record, const std::vector<const CatalogEntry*
         complete_ = false;
         break;
       }
-      const bool null = has_null_bitmap && (rec[bitmap_at + (col.id - 1) / 8] >> ((col.id - 1) % 8)) & 1;
+      const bool null =
+          has_null_bitmap && (rec[bitmap_at + (col.id - 1) / 8] >> ((col.id - 1) % 8)) & 1;
       if (null) continue;
       v.value = rec.Sub(at, col.size);
       v.present = true;

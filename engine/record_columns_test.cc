@@ -43,10 +43,10 @@ Bytes FixedAndVariable() {
   Append(r, {0x78, 0x56, 0x34, 0x12});
   Append(r, {0xFF, 0xFF});
   Append(r, {0x09});
-  Append(r, {0x02});  // bit 1: column 2 is null
-  AppendU16(r, 3);                  // 128: "abc"
-  AppendU16(r, 0x8000 | 3);         // 129: null
-  AppendU16(r, 5);                  // 130: 2 bytes
+  Append(r, {0x02});         // bit 1: column 2 is null
+  AppendU16(r, 3);           // 128: "abc"
+  AppendU16(r, 0x8000 | 3);  // 129: null
+  AppendU16(r, 5);           // 130: 2 bytes
   Append(r, {'a', 'b', 'c', 0xDE, 0xAD});
   return r;
 }
@@ -54,8 +54,8 @@ Bytes FixedAndVariable() {
 TEST(RecordColumnsTest, FixedAndVariableColumnsWithNulls) {
   auto columns = Columns();
   RecordColumns rc;
-  ASSERT_TRUE(rc.Split(ByteView(FixedAndVariable()), Pointers(columns),
-                       TaggedForm::kSmallPageArray));
+  ASSERT_TRUE(
+      rc.Split(ByteView(FixedAndVariable()), Pointers(columns), TaggedForm::kSmallPageArray));
   uint32_t u32 = 0;
   EXPECT_EQ(rc.GetU32(0, &u32), 1);
   EXPECT_EQ(u32, 0x12345678u);
@@ -129,8 +129,8 @@ TEST(RecordColumnsTest, TaggedAreaForms) {
     AppendU16(a, 256), AppendU16(a, 2), Append(a, {0x11, 0x22});
     AppendU16(a, 257), AppendU16(a, 0x8000 | 2), Append(a, {0x03, 'z'});
     AppendU16(a, 300), AppendU16(a, 4), Append(a, {7, 0, 0, 0});
-    cases.push_back({"inline", TaggedForm::kInline, a, Bytes{0x11, 0x22}, Bytes{'z'},
-                     Bytes{7, 0, 0, 0}, 0x03});
+    cases.push_back(
+        {"inline", TaggedForm::kInline, a, Bytes{0x11, 0x22}, Bytes{'z'}, Bytes{7, 0, 0, 0}, 0x03});
   }
   auto columns = Columns();
   for (const auto& c : cases) {
@@ -217,8 +217,8 @@ TEST(ColumnValueTest, GettersHonourTypeSizeSignAndByteOrder) {
   EXPECT_EQ(u64, 0xFFFFu);
   EXPECT_EQ(GetU64(value(kTypeDateTime, {1, 0, 0, 0, 0, 0, 0, 0}), &u64), 1);
   EXPECT_EQ(GetU64(value(kTypeDateTime, {1, 0, 0, 0, 0, 0, 0, 0}, kByteOrderBig), &u64), 0);
-  EXPECT_EQ(GetU32(value(kTypeLong, {1, 2, 3}), &u32), -1);      // wrong size
-  EXPECT_EQ(GetU32(value(kTypeText, {1, 2, 3, 4}), &u32), 0);    // wrong type
+  EXPECT_EQ(GetU32(value(kTypeLong, {1, 2, 3}), &u32), -1);       // wrong size
+  EXPECT_EQ(GetU32(value(kTypeText, {1, 2, 3, 4}), &u32), 0);     // wrong type
   EXPECT_EQ(GetU32(value(kTypeLongLong, Bytes(8, 0)), &u32), 0);  // too wide for u32
   double d = 0;
   EXPECT_EQ(GetDouble(value(kTypeFloat, {0, 0, 0xC0, 0x3F}), &d), 1);

@@ -43,17 +43,17 @@ struct RecordRef {
   uint16_t tag_index = 0;
   uint16_t data_offset = 0;  // of the data part, from the node start
   uint16_t data_size = 0;
-  uint32_t object_id = 0;    // the tree the page belongs to (page header)
-  Bytes key;                 // prefix + suffix
+  uint32_t object_id = 0;  // the tree the page belongs to (page header)
+  Bytes key;               // prefix + suffix
 };
 
 // The outcome of decoding one node.
 enum class NodeDecode {
   kOk,
-  kDeleted,         // flagged deleted: not a record
-  kDamaged,         // its tag pointed outside the page, or it is too short
-  kRootPrefix,      // prefix-compressed on a root page, which cannot be
-  kPrefixTooLong,   // its prefix is longer than the page's external header
+  kDeleted,        // flagged deleted: not a record
+  kDamaged,        // its tag pointed outside the page, or it is too short
+  kRootPrefix,     // prefix-compressed on a root page, which cannot be
+  kPrefixTooLong,  // its prefix is longer than the page's external header
 };
 
 // Decodes node `tag` of `page` into `ref` (kind and file position are left to

@@ -100,8 +100,8 @@ bool TreeCursor::Descend(uint32_t page_number, ByteView key, int depth) {
     // The first node at or after the key, else the last node (Seek then
     // steps along the chain).
     const auto& nodes = page_->nodes();
-    std::optional<size_t> first = PartitionTags(
-        *page_, [&](ByteView node_key) { return CompareKeys(node_key, key) < 0; });
+    std::optional<size_t> first =
+        PartitionTags(*page_, [&](ByteView node_key) { return CompareKeys(node_key, key) < 0; });
     if (first && nodes.size() > 1) {
       return SettleFrom(*first < nodes.size() ? *first : nodes.size() - 1);
     }

@@ -4,8 +4,8 @@ namespace tarnwell::engine {
 
 uint64_t RecordFilePosition(const PageFile& file, uint32_t page_number, uint16_t node_offset) {
   const int64_t p = int64_t(file.page_size());
-  return uint64_t((int64_t(page_number) - 1) * p + file.adjustment() +
-                  int64_t(file.base_offset()) + node_offset);
+  return uint64_t((int64_t(page_number) - 1) * p + file.adjustment() + int64_t(file.base_offset()) +
+                  node_offset);
 }
 
 int TreeWalker::Walk(uint32_t root_page, const LeafVisitor& visit) {

@@ -29,14 +29,14 @@ enum class PageFamily {
 
 struct VersionInfo {
   VersionCode code;
-  const char* name;       // as the version chooser lists it
-  int combo_index;        // position in the version chooser
+  const char* name;  // as the version chooser lists it
+  int combo_index;   // position in the version chooser
   uint32_t page_size;
   PageFamily family;
-  bool has_probe;         // whether the adjustment probe runs for this version
+  bool has_probe;              // whether the adjustment probe runs for this version
   uint32_t probe_root_flags;   // flags of page 1, the database root
   uint32_t probe_space_flags;  // flags of pages 2 and 3, its space trees
-  uint32_t scan_skip;     // bytes after the database start that the page scan skips
+  uint32_t scan_skip;          // bytes after the database start that the page scan skips
 };
 
 // Information on a version code; nullptr for codes outside 1..5.

@@ -31,8 +31,8 @@ std::tm Local(std::time_t t) {
 // The XDG user-dirs file names the desktop as XDG_DESKTOP_DIR="$HOME/...".
 std::string XdgDesktop(const std::string& home) {
   const char* config = std::getenv("XDG_CONFIG_HOME");
-  const std::string dirs = (config && *config ? std::string(config) : home + "/.config") +
-                           "/user-dirs.dirs";
+  const std::string dirs =
+      (config && *config ? std::string(config) : home + "/.config") + "/user-dirs.dirs";
   std::ifstream in(dirs);
   std::string line;
   while (std::getline(in, line)) {

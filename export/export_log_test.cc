@@ -17,7 +17,8 @@ std::string ReadUtf16File(const std::string& path) {
   EXPECT_GE(bytes.size(), 2u);
   EXPECT_EQ(uint8_t(bytes[0]), 0xFF);
   EXPECT_EQ(uint8_t(bytes[1]), 0xFE);
-  return Utf16LEToUtf8(ByteView(reinterpret_cast<const uint8_t*>(bytes.data()) + 2, bytes.size() - 2));
+  return Utf16LEToUtf8(
+      ByteView(reinterpret_cast<const uint8_t*>(bytes.data()) + 2, bytes.size() - 2));
 }
 
 TEST(ExportLogTest, WritesTheRunInUtf16WithItsVocabulary) {

@@ -300,16 +300,16 @@ void WriteMessagesAndBlobs(Corpus* corpus) {
                            "Content-Transfer-Encoding: base64\r\n\r\nAAECAwQ=\r\n--b--\r\n"));
   // Documented layout: "ProP", u16, count 2, {kind, id, offset}; 'M' values.
   Bytes documented = forge::Ascii("ProP");
-  const uint8_t entries[] = {0, 0, 2, 0,  0x48, 0x48, 0x42, 0x00, 24, 0, 0, 0,
-                             0x18, 0x18, 0x07, 0x0E, 1, 0, 0, 0};
+  const uint8_t entries[] = {0, 0, 2,    0,    0x48, 0x48, 0x42, 0x00, 24, 0,
+                             0, 0, 0x18, 0x18, 0x07, 0x0E, 1,    0,    0,  0};
   documented.insert(documented.end(), std::begin(entries), std::end(entries));
   const uint8_t value[] = {'M', 3, 'a', 'b', 'c'};
   documented.insert(documented.end(), std::begin(value), std::end(value));
   corpus->Put("blob", "documented", documented);
   // Real layout: "ProP", flags 0x0400, count 2, 3-byte entries, values.
   Bytes real = forge::Ascii("ProP");
-  const uint8_t real_tail[] = {0x00, 0x04, 2, 0,  0x48, 0x1D, 0x0E,  0x18, 0x36, 0x00,
-                               0x4D, 2, 'h', 'i',  0x19, 0x05};
+  const uint8_t real_tail[] = {0x00, 0x04, 2,    0, 0x48, 0x1D, 0x0E, 0x18,
+                               0x36, 0x00, 0x4D, 2, 'h',  'i',  0x19, 0x05};
   real.insert(real.end(), std::begin(real_tail), std::end(real_tail));
   corpus->Put("blob", "real", real);
 }

@@ -86,8 +86,8 @@ void SetPlainText(CMimeBody* body, const std::string& text) {
 
 }  // namespace
 
-bool ParseDateText(const std::string& text, int* year, int* month, int* day, int* hour,
-                   int* minute, int* second) {
+bool ParseDateText(const std::string& text, int* year, int* month, int* day, int* hour, int* minute,
+                   int* second) {
   char tail = 0;
   if (std::sscanf(text.c_str(), "%d/%d/%d %d:%d:%d%c", day, month, year, hour, minute, second,
                   &tail) != 6) {
@@ -99,8 +99,7 @@ bool ParseDateText(const std::string& text, int* year, int* month, int* day, int
 
 Status ComposeMessage(const store::MessageRecord& message, store::FileTime date,
                       std::vector<store::AttachmentRecord>& attachments,
-                      const HeaderStrings& headers, const ComposeOptions& options,
-                      MimeSink* out) {
+                      const HeaderStrings& headers, const ComposeOptions& options, MimeSink* out) {
   CMimeMessage m;
   SetHeaders(m, headers, date, options);
   CMimeBody* body = m.CreatePart();
@@ -134,8 +133,7 @@ Status ComposeTask(const store::TaskRecord& task, const std::optional<Bytes>& rt
 Status ComposeCarrier(const std::string& media_type, const std::string& file_name,
                       const std::string& text, store::FileTime date,
                       std::vector<store::AttachmentRecord>& attachments,
-                      const HeaderStrings& headers, const ComposeOptions& options,
-                      MimeSink* out) {
+                      const HeaderStrings& headers, const ComposeOptions& options, MimeSink* out) {
   CMimeMessage m;
   SetHeaders(m, headers, date, options);
   CMimeBody* part = m.CreatePart();

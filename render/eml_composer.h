@@ -35,7 +35,7 @@ struct HeaderStrings {
 };
 
 struct ComposeOptions {
-  bool store_text = true;           // UTF-8 header texts; off: the ANSI code page
+  bool store_text = true;  // UTF-8 header texts; off: the ANSI code page
   uint32_t ansi_code_page = 1252;
 };
 
@@ -45,8 +45,7 @@ struct ComposeOptions {
 // attachment is held once.
 Status ComposeMessage(const store::MessageRecord& message, store::FileTime date,
                       std::vector<store::AttachmentRecord>& attachments,
-                      const HeaderStrings& headers, const ComposeOptions& options,
-                      MimeSink* out);
+                      const HeaderStrings& headers, const ComposeOptions& options, MimeSink* out);
 
 // A task: its plain-text body, no HTML part, its RTF body if any.
 Status ComposeTask(const store::TaskRecord& task, const std::optional<Bytes>& rtf,
@@ -59,13 +58,12 @@ Status ComposeTask(const store::TaskRecord& task, const std::optional<Bytes>& rt
 Status ComposeCarrier(const std::string& media_type, const std::string& file_name,
                       const std::string& text, store::FileTime date,
                       std::vector<store::AttachmentRecord>& attachments,
-                      const HeaderStrings& headers, const ComposeOptions& options,
-                      MimeSink* out);
+                      const HeaderStrings& headers, const ComposeOptions& options, MimeSink* out);
 
 // Parses the item list's date text ("%d/%m/%Y %H:%M:%S"); false when it is
 // not such a date.
-bool ParseDateText(const std::string& text, int* year, int* month, int* day, int* hour,
-                   int* minute, int* second);
+bool ParseDateText(const std::string& text, int* year, int* month, int* day, int* hour, int* minute,
+                   int* second);
 
 }  // namespace tarnwell::render
 

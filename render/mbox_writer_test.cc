@@ -12,7 +12,8 @@ namespace {
 
 TEST(MboxWriterTest, QuotesFromLinesSoEveryMessageReadsBackWhole) {
   const std::string body = "From me\r\n>From you\r\nFromage\r\nx From y\r\n";
-  const Bytes quoted = QuoteFromLines(ByteView(reinterpret_cast<const uint8_t*>(body.data()), body.size()));
+  const Bytes quoted =
+      QuoteFromLines(ByteView(reinterpret_cast<const uint8_t*>(body.data()), body.size()));
   EXPECT_EQ(ByteView(quoted).ToString(), ">From me\r\n>>From you\r\nFromage\r\nx From y\r\n");
 
   if (std::system("/usr/bin/python3 -c 'import mailbox' 2>/dev/null") != 0) {
@@ -25,7 +26,9 @@ TEST(MboxWriterTest, QuotesFromLinesSoEveryMessageReadsBackWhole) {
   ASSERT_TRUE(writer.Open(path).ok());
   const std::string first = "Subject: one\r\n\r\nFirst line\r\nFrom the start of a line\r\n";
   const std::string second = "Subject: two\r\n\r\nno final line end";
-  ASSERT_TRUE(writer.Append(ByteView(reinterpret_cast<const uint8_t*>(first.data()), first.size()), 0).ok());
+  ASSERT_TRUE(
+      writer.Append(ByteView(reinterpret_cast<const uint8_t*>(first.data()), first.size()), 0)
+          .ok());
   // The streamed form, fed in pieces that split a "From " line.
   MimeSink* sink = writer.Begin(0);
   ASSERT_NE(sink, nullptr);
@@ -41,7 +44,10 @@ TEST(MboxWriterTest, QuotesFromLinesSoEveryMessageReadsBackWhole) {
       "print(len(msgs))\n"
       "for m in msgs: print(m['subject'], repr(m.get_payload()))\n";
   std::ofstream(dir + "/read.py") << script;
-  ASSERT_EQ(std::system(("/usr/bin/python3 " + dir + "/read.py " + path + " > " + dir + "/out.txt").c_str()), 0);
+  ASSERT_EQ(
+      std::system(
+          ("/usr/bin/python3 " + dir + "/read.py " + path + " > " + dir + "/out.txt").c_str()),
+      0);
   std::ifstream in(dir + "/out.txt");
   std::string count, line1, line2;
   std::getline(in, count);

@@ -70,7 +70,8 @@ std::vector<uint32_t> FolderList::Children(uint32_t index) const {
   if (index >= nodes_.size()) return out;
   // A damaged list could chain siblings into a loop: never visit one twice.
   std::set<uint32_t> seen;
-  for (uint32_t c = nodes_[index].first_child; c != 0 && c < nodes_.size(); c = nodes_[c].next_sibling) {
+  for (uint32_t c = nodes_[index].first_child; c != 0 && c < nodes_.size();
+       c = nodes_[c].next_sibling) {
     if (!seen.insert(c).second) break;
     out.push_back(c);
   }
@@ -83,10 +84,14 @@ int IconForFolderName(const std::string& display_name) {
     int icon;
   };
   static const Entry kIcons[] = {
-      {"junk e-mail", 14}, {"inbox", 3},          {"outbox", 6},          {"rss feeds", 17},
-      {"sent items", 7},   {"drafts", 2},         {"deleted items", 16},  {"large mail", 15},
-      {"unread mail", 15}, {"categorized mail", 15}, {"search folders", 15}, {"search", 15},
-      {"calendar", 1},     {"tasks", 8},          {"journal", 4},         {"notes", 5},
+      {"junk e-mail", 14},    {"inbox", 3},
+      {"outbox", 6},          {"rss feeds", 17},
+      {"sent items", 7},      {"drafts", 2},
+      {"deleted items", 16},  {"large mail", 15},
+      {"unread mail", 15},    {"categorized mail", 15},
+      {"search folders", 15}, {"search", 15},
+      {"calendar", 1},        {"tasks", 8},
+      {"journal", 4},         {"notes", 5},
       {"contacts", 10},
   };
   const std::string name = AsciiLower(TrimTrailingSpace(display_name));
@@ -104,9 +109,9 @@ void InsertChildrenOnce(const FolderList& folders, uint32_t index, int64_t item,
     if (!shown.insert(child).second) continue;  // a cycle in damaged links
     const FolderNode& node = folders[child];
     const int icon = IconForFolderName(node.display_name);
-    const int64_t handle = mailbox >= 0
-                               ? sink.AddMailboxFolder(item, node.display_name, icon, mailbox, child)
-                               : sink.AddFolder(item, node.display_name, icon, child);
+    const int64_t handle =
+        mailbox >= 0 ? sink.AddMailboxFolder(item, node.display_name, icon, mailbox, child)
+                     : sink.AddFolder(item, node.display_name, icon, child);
     InsertChildrenOnce(folders, child, handle, sink, mailbox, shown);
   }
 }

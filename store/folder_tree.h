@@ -82,8 +82,8 @@ bool ShowTree(const FolderList& folders, bool public_store, const std::string& d
 
 // Inserts the children of node `index` of `folders` below `item`, depth
 // first; with `mailbox` >= 0 through AddMailboxFolder.
-void InsertChildren(const FolderList& folders, uint32_t index, int64_t item,
-                    FolderTreeSink& sink, int32_t mailbox = -1);
+void InsertChildren(const FolderList& folders, uint32_t index, int64_t item, FolderTreeSink& sink,
+                    int32_t mailbox = -1);
 
 }  // namespace tarnwell::store
 

@@ -62,13 +62,13 @@ TEST(FolderTreeTest, LinksChildrenInReverseAndDropsWhatHasNoParent) {
   list.Append(Node("Lost", 204, 999));        // parent unknown: not shown
   list.Append(Node("Late child", 205, 206));  // parent appended after it
   list.Append(Node("Late parent", 206, 100));
-  list.Append(Node("inbox ", 207, 200));      // icon by name, case and blanks ignored
+  list.Append(Node("inbox ", 207, 200));  // icon by name, case and blanks ignored
   list.LinkTree(NullProgress());
   RecordingSink sink;
   ASSERT_TRUE(ShowTree(list, false, "/data/priv1.edb", 7, sink));
-  const std::vector<std::string> want = {"0:/data/priv1.edb", "1:Mailbox A", "2:Late parent",
-                                         "3:Late child",      "2:C",           "2:B",
-                                         "2:A",               "3:inbox "};
+  const std::vector<std::string> want = {
+      "0:/data/priv1.edb", "1:Mailbox A", "2:Late parent", "3:Late child", "2:C", "2:B", "2:A",
+      "3:inbox "};
   EXPECT_EQ(sink.lines, want);
   EXPECT_EQ(sink.icons.back(), 3);
 }
@@ -89,19 +89,20 @@ TEST(FolderTreeTest, PublicStoreShowsItsPublicRoot) {
 
 TEST(FolderTreeTest, IconsByName) {
   const std::pair<const char*, int> cases[] = {
-      {"Junk E-mail", 14}, {"INBOX", 3}, {"Outbox", 6},  {"RSS Feeds", 17}, {"Sent Items", 7},
-      {"Drafts", 2},       {"Deleted Items", 16}, {"Search Folders", 15}, {"Calendar", 1},
-      {"Tasks", 8},        {"Journal", 4}, {"Notes  ", 5}, {"Contacts", 10}, {"Projects", 11},
+      {"Junk E-mail", 14}, {"INBOX", 3},     {"Outbox", 6},         {"RSS Feeds", 17},
+      {"Sent Items", 7},   {"Drafts", 2},    {"Deleted Items", 16}, {"Search Folders", 15},
+      {"Calendar", 1},     {"Tasks", 8},     {"Journal", 4},        {"Notes  ", 5},
+      {"Contacts", 10},    {"Projects", 11},
   };
   for (const auto& [name, icon] : cases) EXPECT_EQ(IconForFolderName(name), icon) << name;
 }
 
 TEST(ContentTableNameTest, TakesTheTextAfterTheLastRunOfFourZeros) {
   EXPECT_EQ(ContentTableName(0x0001000000000A3Full), "A3F");
-  EXPECT_EQ(ContentTableName(0x1234ull), "234");          // no run: from index 1
-  EXPECT_EQ(ContentTableName(0x10000ull), "");            // the run ends the text
-  EXPECT_EQ(ContentTableName(0x1000020000b1ull), "B1");   // the last run wins
-  EXPECT_EQ(ContentTableName(0x00000000ull), "");         // "0"
+  EXPECT_EQ(ContentTableName(0x1234ull), "234");         // no run: from index 1
+  EXPECT_EQ(ContentTableName(0x10000ull), "");           // the run ends the text
+  EXPECT_EQ(ContentTableName(0x1000020000b1ull), "B1");  // the last run wins
+  EXPECT_EQ(ContentTableName(0x00000000ull), "");        // "0"
 }
 
 TEST(KeyOrdinalMapTest, RepeatedKeysGetNoOrdinalAndOrdinalsStayDense) {

@@ -3,8 +3,8 @@
 namespace tarnwell::store {
 
 std::string MessageFlagsText(uint32_t flags) {
-  static const char* const kTexts[] = {"Read,",   "Unmodified,", "Submit,",     "unsent,",
-                                       "Attachment,", "From Me,", "Associated,", "Resend,",
+  static const char* const kTexts[] = {"Read,",       "Unmodified,", "Submit,",     "unsent,",
+                                       "Attachment,", "From Me,",    "Associated,", "Resend,",
                                        "NR Pending,", "NRN pending,"};
   std::string out;
   for (unsigned bit = 0; bit < sizeof kTexts / sizeof kTexts[0]; ++bit) {

@@ -57,7 +57,8 @@ std::vector<uint64_t> KeyOrdinalMap::Finish() {
   for (size_t i = 0; i < n; ++i) {
     const size_t p = ordinals_[i] & ~kVisited;
     if (is_dropped(p)) continue;
-    const uint64_t below = p % kWordBits ? dropped_bits[p / kWordBits] & ((uint64_t(1) << (p % kWordBits)) - 1) : 0;
+    const uint64_t below =
+        p % kWordBits ? dropped_bits[p / kWordBits] & ((uint64_t(1) << (p % kWordBits)) - 1) : 0;
     const uint32_t dropped = dropped_before[p / kWordBits] + uint32_t(__builtin_popcountll(below));
     keys_[kept] = keys_[i];
     ordinals_[kept] = uint32_t(p + 1 - dropped);

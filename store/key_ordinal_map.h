@@ -31,8 +31,8 @@ class KeyOrdinalMap {
   std::vector<uint64_t> KeysByOrdinal() const;
 
  private:
-  std::vector<uint64_t> keys_;       // walk order, then key order
-  std::vector<uint32_t> ordinals_;   // parallel to keys_ after Finish()
+  std::vector<uint64_t> keys_;      // walk order, then key order
+  std::vector<uint32_t> ordinals_;  // parallel to keys_ after Finish()
   bool finished_ = false;
 };
 

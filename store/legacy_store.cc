@@ -25,9 +25,9 @@ std::optional<uint64_t> KeyOf(const RowValue& v) {
 }
 
 const std::vector<std::string>& ListColumns() {
-  static const std::vector<std::string> kColumns = {
-      "S678e", "S42", "N67b9", "N67bd", "N67b0", "T3007", "S1a",
-      "Se1d",  "Be1b", "S3d",  "L17",   "Le07",  "Te06",  "T3008"};
+  static const std::vector<std::string> kColumns = {"S678e", "S42",  "N67b9", "N67bd", "N67b0",
+                                                    "T3007", "S1a",  "Se1d",  "Be1b",  "S3d",
+                                                    "L17",   "Le07", "Te06",  "T3008"};
   return kColumns;
 }
 
@@ -183,8 +183,8 @@ bool LegacyStore::BuildAttachmentMap() {
   if (mode_ == ScanMode::kStandard) return true;
   const std::string key = version_ == engine::kExchange55 ? "Q674a" : "Q3f88";
   attachment_index_.clear();
-  const bool ok = WalkKeyedTable(*attachment_table_, key, &attachment_map_,
-                                 kAttachmentLocationFile, &attachment_locations_, true);
+  const bool ok = WalkKeyedTable(*attachment_table_, key, &attachment_map_, kAttachmentLocationFile,
+                                 &attachment_locations_, true);
   std::stable_sort(attachment_index_.begin(), attachment_index_.end(),
                    [](const auto& a, const auto& b) { return a.first < b.first; });
   attachment_index_built_ = ok;
@@ -239,7 +239,8 @@ std::optional<engine::RecordRef> LegacyStore::FindMessage(uint64_t message_key) 
     for (size_t i = 0; i < kMessageKeySize; ++i) key.push_back(uint8_t(message_key >> (8 * i)));
     key.push_back(kKeySegmentLength);
     engine::RecordRef ref;
-    if (engine::SeekKey(reader_.file(), message_table_->table.root_page(), ByteView(key), &ref) != 1) {
+    if (engine::SeekKey(reader_.file(), message_table_->table.root_page(), ByteView(key), &ref) !=
+        1) {
       return std::nullopt;
     }
     ref.kind = engine::kKindRecord;
@@ -293,10 +294,9 @@ std::vector<AttachmentRecord> LegacyStore::ListAttachments(uint64_t message_key)
   if (!attachment_table_) attachment_table_ = FindListedTable(attachment_table_name());
   if (!attachment_table_) return out;
   if (!attachment_index_built_) BuildAttachmentIndex();
-  auto range = std::equal_range(
-      attachment_index_.begin(), attachment_index_.end(),
-      std::make_pair(message_key, RecordLocation{}),
-      [](const auto& a, const auto& b) { return a.first < b.first; });
+  auto range = std::equal_range(attachment_index_.begin(), attachment_index_.end(),
+                                std::make_pair(message_key, RecordLocation{}),
+                                [](const auto& a, const auto& b) { return a.first < b.first; });
   for (auto it = range.first; it != range.second; ++it) {
     engine::RecordRef ref = reader_.MakeRecordRef(it->second.page_number, it->second.tag_index);
     if (ref.kind != engine::kKindRecord) continue;

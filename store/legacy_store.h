@@ -120,8 +120,8 @@ class LegacyStore : public MailStore {
                     DecodePurpose purpose, ItemRecords* records,
                     const std::vector<std::string>* only = nullptr);
   bool WalkKeyedTable(const engine::TableDef& table, const std::string& key_column,
-                      KeyOrdinalMap* map, const std::string& location_name,
-                      LocationFile* locations, bool index_attachments);
+                      KeyOrdinalMap* map, const std::string& location_name, LocationFile* locations,
+                      bool index_attachments);
   void BuildAttachmentIndex();
 
   engine::EdbClass& reader_;

@@ -191,7 +191,8 @@ TEST_P(LegacyStoreTest, ListsAndItemsMatchTheManifest) {
         }
         if (!want.rtf_text.empty()) {
           ASSERT_TRUE(m.rtf_body);
-          EXPECT_EQ(ByteView(*m.rtf_body).ToString().substr(0, want.rtf_text.size()), want.rtf_text);
+          EXPECT_EQ(ByteView(*m.rtf_body).ToString().substr(0, want.rtf_text.size()),
+                    want.rtf_text);
         }
         ASSERT_EQ(m.members.size(), want.members.size());
         for (size_t k = 0; k < m.members.size(); ++k) {

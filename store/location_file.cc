@@ -28,7 +28,8 @@ Status LocationFile::Open(const std::string& path) {
   file_ = std::fopen(path.c_str(), "rb");
   if (!file_) return Status::IoError(path + ": " + std::strerror(errno));
   path_ = path;
-  if (std::fseek(file_, 0, SEEK_END) == 0) count_ = uint64_t(std::ftell(file_)) / kRecordLocationSize;
+  if (std::fseek(file_, 0, SEEK_END) == 0)
+    count_ = uint64_t(std::ftell(file_)) / kRecordLocationSize;
   return Status::Ok();
 }
 

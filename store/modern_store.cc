@@ -30,16 +30,36 @@ struct Columns {
   const char* container_class;
   const char* message_class;
 };
-constexpr Columns k2013 = {"MailboxNumber", "DisplayName", "FolderId", "ParentFolderId",
+constexpr Columns k2013 = {"MailboxNumber", "DisplayName",    "FolderId",    "ParentFolderId",
                            "DisplayName",   "ContainerClass", "MessageClass"};
 constexpr Columns k2010 = {"Q6764", "S3001", "Q6748", "Q6749", "S3001", "S3613", "S1a"};
 
 const std::vector<std::string>& ListColumns() {
-  static const std::vector<std::string> kColumns = {
-      "DisplayTo", "RecipientList", "MessageId", "DateCreated", "MessageClass", "PropertyBlob",
-      "HasAttachments", "SubjectPrefix", "Importance", "IsRead", "DateReceived",
-      "LastModificationTime", "S678e", "N67b0", "T3007", "S1a", "Be1b", "Le07", "L17", "T3008",
-      "Te06", "Q6748", "S42", "S3d", "Se1d"};
+  static const std::vector<std::string> kColumns = {"DisplayTo",
+                                                    "RecipientList",
+                                                    "MessageId",
+                                                    "DateCreated",
+                                                    "MessageClass",
+                                                    "PropertyBlob",
+                                                    "HasAttachments",
+                                                    "SubjectPrefix",
+                                                    "Importance",
+                                                    "IsRead",
+                                                    "DateReceived",
+                                                    "LastModificationTime",
+                                                    "S678e",
+                                                    "N67b0",
+                                                    "T3007",
+                                                    "S1a",
+                                                    "Be1b",
+                                                    "Le07",
+                                                    "L17",
+                                                    "T3008",
+                                                    "Te06",
+                                                    "Q6748",
+                                                    "S42",
+                                                    "S3d",
+                                                    "Se1d"};
   return kColumns;
 }
 
@@ -119,8 +139,8 @@ bool ModernStore::WalkMailboxes() {
       if (!number) return true;
       if (name_slot >= 0 && values.ReadOne(columns, size_t(name_slot), &name)) {
         ItemRecords records;
-        decoder_.Decode(DecodePurpose::kFolderRow, c.folder_name, name.engine_type,
-                        name.code_page, ByteView(name.bytes), &records);
+        decoder_.Decode(DecodePurpose::kFolderRow, c.folder_name, name.engine_type, name.code_page,
+                        ByteView(name.bytes), &records);
         node.display_name = records.node.display_name;
       }
       node.folder_id = *number;
@@ -202,25 +222,26 @@ void ModernStore::Load(MailboxContext& m) {
   RowValueReader values(lv, *messages);
   const char* key_column = Modern2013(version_) ? "MessageId" : "N67b0";
   const char* folder_column = Modern2013(version_) ? "FolderId" : "Q6748";
-  reader_.ForEachRecord(*messages, [&](const engine::RecordRef& ref, engine::RecordColumns& columns) {
-    uint64_t key = 0;
-    if (Modern2013(version_)) {
-      key = ReadId(values, *messages, columns, key_column, kMinMessageIdSize).value_or(0);
-    } else {
-      const int slot = ColumnSlot(*messages, key_column);
-      RowValue v;
-      if (slot >= 0 && values.ReadOne(columns, size_t(slot), &v) && v.bytes.size() >= kIdSize) {
-        key = LoadU64LE(v.bytes.data());
-      }
-    }
-    if (key == 0) return true;  // no key, or one too short to map
-    m.message_map.Add(key);
-    m.message_locations.Append({ref.page_number, ref.tag_index});
-    if (std::optional<uint64_t> folder = ReadId(values, *messages, columns, folder_column)) {
-      m.folder_messages[*folder].push_back(key);
-    }
-    return true;
-  });
+  reader_.ForEachRecord(
+      *messages, [&](const engine::RecordRef& ref, engine::RecordColumns& columns) {
+        uint64_t key = 0;
+        if (Modern2013(version_)) {
+          key = ReadId(values, *messages, columns, key_column, kMinMessageIdSize).value_or(0);
+        } else {
+          const int slot = ColumnSlot(*messages, key_column);
+          RowValue v;
+          if (slot >= 0 && values.ReadOne(columns, size_t(slot), &v) && v.bytes.size() >= kIdSize) {
+            key = LoadU64LE(v.bytes.data());
+          }
+        }
+        if (key == 0) return true;  // no key, or one too short to map
+        m.message_map.Add(key);
+        m.message_locations.Append({ref.page_number, ref.tag_index});
+        if (std::optional<uint64_t> folder = ReadId(values, *messages, columns, folder_column)) {
+          m.folder_messages[*folder].push_back(key);
+        }
+        return true;
+      });
   std::vector<uint64_t> dropped = m.message_map.Finish();
   CompactLocations(&m.message_locations, dropped);
 }
@@ -258,7 +279,8 @@ std::vector<MessageSummary> ModernStore::ListFolder(MailboxContext& m, uint32_t 
       RowValue v;
       if (slot < 0 || !values.ReadOne(columns, size_t(slot), &v)) continue;
       if (name == "PropertyBlob") {
-        if (Modern2013(version_)) ParseBlobForList(ByteView(v.bytes), blob_options, &records.summary);
+        if (Modern2013(version_))
+          ParseBlobForList(ByteView(v.bytes), blob_options, &records.summary);
         continue;
       }
       decoder_.Decode(DecodePurpose::kMessageListRow, name, v.engine_type, v.code_page,
@@ -373,8 +395,8 @@ bool ModernStore::ShowTree(const std::string& database_path, uint64_t source_num
                            FolderTreeSink& sink) {
   const int start = folders_.FindByName(public_store_ ? kPublicRootName : kRootName);
   if (start < 0) return false;
-  const int64_t top = sink.AddTopItem(
-      public_store_ ? folders_[start].display_name : database_path, kIconDatabase, source_number);
+  const int64_t top = sink.AddTopItem(public_store_ ? folders_[start].display_name : database_path,
+                                      kIconDatabase, source_number);
   for (uint32_t child : folders_.Children(uint32_t(start))) {
     const FolderNode& node = folders_[child];
     const int64_t item =

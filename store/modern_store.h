@@ -41,7 +41,6 @@ namespace tarnwell::store {
 // later (2010).
 std::string ModernFolderTableName(int version, uint64_t mailbox_number);
 
-
 struct MailboxContext {
   uint32_t node_index = 0;  // the mailbox's node in the store's folder list
   uint64_t number = 0;

@@ -6,8 +6,8 @@
 #include "base/date_time.h"
 #include "base/text.h"
 #include "engine/catalog_entry.h"
-#include "store/rtf_decompressor.h"
 #include "store/distribution_list.h"
+#include "store/rtf_decompressor.h"
 #include "store/typed_binary.h"
 
 namespace tarnwell::store {

@@ -84,8 +84,9 @@ bool RowValueReader::ReadOne(const engine::RecordColumns& columns, size_t slot, 
         }
         Bytes element;
         uint32_t cp = out->code_page;
-        if (!Resolve(b.Sub(begin, end - begin), (word & kMultiSeparatedBit) ? engine::kTaggedSeparated : 0,
-                     &element, &out->damaged, &cp, max_long_value)) {
+        if (!Resolve(b.Sub(begin, end - begin),
+                     (word & kMultiSeparatedBit) ? engine::kTaggedSeparated : 0, &element,
+                     &out->damaged, &cp, max_long_value)) {
           continue;
         }
         elements.push_back(std::move(element));
@@ -96,8 +97,8 @@ bool RowValueReader::ReadOne(const engine::RecordColumns& columns, size_t slot, 
       for (size_t k = 0; k < elements.size(); ++k) {
         if (k) joined += ";";
         ByteView e(elements[k]);
-        std::string text = out->code_page == kUtf16CodePage ? Utf16LEToUtf8(e)
-                                                            : CodePageToUtf8(e, out->code_page);
+        std::string text =
+            out->code_page == kUtf16CodePage ? Utf16LEToUtf8(e) : CodePageToUtf8(e, out->code_page);
         while (!text.empty() && text.back() == '\0') text.pop_back();
         joined += text;
       }

@@ -29,7 +29,8 @@ struct RowValue {
 class RowValueReader {
  public:
   RowValueReader(const engine::LongValueReader& long_values, const engine::TableDef& table)
-      : long_values_(long_values), table_(table),
+      : long_values_(long_values),
+        table_(table),
         lv_root_(table.long_value ? table.long_value->root_page() : 0) {}
 
   // The present values of `columns`, in catalog order. Long values larger
