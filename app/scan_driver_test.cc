@@ -10,7 +10,7 @@
 #include "testing/ese_writer.h"
 #include "testing/exchange/modern_store_builder.h"
 #include "testing/exchange/store_builder.h"
-#include "testing/forge_spec.h"
+#include "testing/forge_layout.h"
 
 namespace tarnwell::app {
 namespace {

@@ -47,7 +47,7 @@ struct Expect {
 
 struct ValueCase {
   const char* name;
-  forge::ColumnSpec column;
+  forge::ColumnLayout column;
   forge::Cell cell;
   Expect expect;
 };
@@ -138,26 +138,26 @@ std::vector<ValueCase> Cases() {
 
 // One row per case holding only that case's column, plus the long value
 // the separated cases refer to.
-forge::DatabaseSpec ValuesDatabase(const Format& f, const std::vector<ValueCase>& cases) {
-  forge::DatabaseSpec spec;
-  spec.page_size = f.page_size;
-  spec.format_revision = f.revision;
-  forge::TableSpec t;
+forge::DatabaseLayout ValuesDatabase(const Format& f, const std::vector<ValueCase>& cases) {
+  forge::DatabaseLayout layout;
+  layout.page_size = f.page_size;
+  layout.format_revision = f.revision;
+  forge::TableLayout t;
   t.name = "Values";
   t.columns.push_back({kIdColumn, "Id", forge::kColumnLong});
   for (const ValueCase& c : cases) t.columns.push_back(c.column);
   for (size_t i = 0; i < cases.size(); ++i) {
-    forge::RowSpec row;
+    forge::RowLayout row;
     row.cells.push_back({kIdColumn, forge::LittleEndian(i + 1, 4)});
     row.cells.push_back(cases[i].cell);
     t.rows.push_back(std::move(row));
   }
-  forge::LongValueSpec lv;
+  forge::LongValueLayout lv;
   lv.id = kAttachmentLv;
   lv.data = forge::Ascii("an attachment that lives in the long-value tree");
   t.long_values.push_back(lv);
-  spec.tables.push_back(std::move(t));
-  return spec;
+  layout.tables.push_back(std::move(t));
+  return layout;
 }
 
 std::string ElementText(const DecodedColumn& d) {

@@ -33,10 +33,10 @@ const Format kFormats[] = {
 
 class TempDatabase {
  public:
-  TempDatabase(const forge::DatabaseSpec& spec, const forge::DamageSpec& damage = {}) {
+  TempDatabase(const forge::DatabaseLayout& layout, const forge::FileDamage& damage = {}) {
     EXPECT_TRUE(MakeTempDir("tarnwell-engine", &dir_).ok());
     path_ = dir_ + "/test.edb";
-    Status s = forge::WriteDatabase(spec, path_, &manifest_, damage);
+    Status s = forge::WriteDatabase(layout, path_, &manifest_, damage);
     EXPECT_TRUE(s.ok()) << s.ToString();
   }
   ~TempDatabase() { std::filesystem::remove_all(dir_); }
@@ -48,8 +48,8 @@ class TempDatabase {
   forge::Manifest manifest_;
 };
 
-forge::DatabaseSpec Sample(const Format& f, uint32_t rows, uint32_t rows_per_leaf = 0,
-                           uint32_t children_per_branch = 0) {
+forge::DatabaseLayout Sample(const Format& f, uint32_t rows, uint32_t rows_per_leaf = 0,
+                             uint32_t children_per_branch = 0) {
   forge::SampleOptions o;
   o.page_size = f.page_size;
   o.revision = f.revision;
@@ -71,9 +71,9 @@ struct ItemRow {
   int64_t long_value;
   std::optional<std::string> name;
 };
-std::vector<ItemRow> ExpectedItems(const forge::DatabaseSpec& spec) {
+std::vector<ItemRow> ExpectedItems(const forge::DatabaseLayout& layout) {
   std::vector<ItemRow> rows;
-  for (const forge::RowSpec& r : spec.tables[0].rows) {
+  for (const forge::RowLayout& r : layout.tables[0].rows) {
     if (r.deleted) continue;
     ItemRow row{0, std::nullopt};
     for (const forge::Cell& c : r.cells) {
@@ -136,8 +136,8 @@ TEST_P(EdbReaderTest, DetectsTheVersionFromTheHeader) {
 TEST_P(EdbReaderTest, StandardModeReadsCatalogAndRecordsInKeyOrder) {
   const Format& f = GetParam();
   // Few rows per leaf and branch: several tree levels.
-  forge::DatabaseSpec spec = Sample(f, 300, 7, 4);
-  TempDatabase db(spec);
+  forge::DatabaseLayout layout = Sample(f, 300, 7, 4);
+  TempDatabase db(layout);
   auto reader = Open(db.path(), f.version);
   ASSERT_EQ(reader->CollectTreeRecords(kCatalogRootPage), 1);
   // The catalog arrives in key order: MSysObjects' own record first.
@@ -150,19 +150,19 @@ TEST_P(EdbReaderTest, StandardModeReadsCatalogAndRecordsInKeyOrder) {
   }
   const TableDef* items = reader->FindTable("Items");
   ASSERT_NE(items, nullptr);
-  ASSERT_EQ(items->columns.size(), spec.tables[0].columns.size());
+  ASSERT_EQ(items->columns.size(), layout.tables[0].columns.size());
   for (size_t i = 0; i < items->columns.size(); ++i) {
-    EXPECT_EQ(items->columns[i].id, spec.tables[0].columns[i].id);
-    EXPECT_EQ(items->columns[i].name, spec.tables[0].columns[i].name);
-    EXPECT_EQ(items->columns[i].column_type(), spec.tables[0].columns[i].type);
+    EXPECT_EQ(items->columns[i].id, layout.tables[0].columns[i].id);
+    EXPECT_EQ(items->columns[i].name, layout.tables[0].columns[i].name);
+    EXPECT_EQ(items->columns[i].column_type(), layout.tables[0].columns[i].type);
   }
-  ExpectSameItems(ExpectedItems(spec), ReadItems(*reader));
+  ExpectSameItems(ExpectedItems(layout), ReadItems(*reader));
 }
 
 TEST_P(EdbReaderTest, AdvanceModeHarvestsTheSameCatalog) {
   const Format& f = GetParam();
-  forge::DatabaseSpec spec = Sample(f, 400, 9, 3);
-  TempDatabase db(spec);
+  forge::DatabaseLayout layout = Sample(f, 400, 9, 3);
+  TempDatabase db(layout);
   auto standard = Open(db.path(), f.version);
   standard->CollectTreeRecords(kCatalogRootPage);
   standard->ParseCatalogRecords();
@@ -173,7 +173,7 @@ TEST_P(EdbReaderTest, AdvanceModeHarvestsTheSameCatalog) {
   ASSERT_TRUE(everything->ScanLeafPages());
   ASSERT_EQ(everything->CollectLeafPageRecords(), 1);
   size_t live_rows = 0;
-  for (const forge::RowSpec& r : spec.tables[0].rows) live_rows += !r.deleted;
+  for (const forge::RowLayout& r : layout.tables[0].rows) live_rows += !r.deleted;
   EXPECT_GE(everything->records().size(), live_rows);
 
   // The catalog harvest keeps the catalog's records only, and finds the same
@@ -199,29 +199,29 @@ TEST_P(EdbReaderTest, AdvanceModeHarvestsTheSameCatalog) {
 TEST_P(EdbReaderTest, AdjustmentProbeFindsJunkAndMissingHeaders) {
   const Format& f = GetParam();
   const VersionInfo* v = FindVersion(f.version);
-  forge::DatabaseSpec spec = Sample(f, 40);
+  forge::DatabaseLayout layout = Sample(f, 40);
   {
-    forge::DamageSpec junk;
+    forge::FileDamage junk;
     junk.junk_prefix = 512;
-    TempDatabase db(spec, junk);
+    TempDatabase db(layout, junk);
     auto reader = Open(db.path(), f.version);
     ASSERT_TRUE(reader->FindAdjustmentFactor());
     EXPECT_EQ(reader->file().adjustment(), 512);
     ASSERT_EQ(reader->CollectTreeRecords(kCatalogRootPage), 1);
     reader->ParseCatalogRecords();
-    ExpectSameItems(ExpectedItems(spec), ReadItems(*reader));
+    ExpectSameItems(ExpectedItems(layout), ReadItems(*reader));
   }
   {
-    forge::DamageSpec headless;
+    forge::FileDamage headless;
     headless.drop_header_pages = true;
-    TempDatabase db(spec, headless);
+    TempDatabase db(layout, headless);
     auto reader = Open(db.path(), f.version);
     ASSERT_TRUE(reader->FindAdjustmentFactor());
     EXPECT_EQ(reader->file().adjustment(), -2 * int64_t(v->page_size));
     EXPECT_EQ(reader->file().missing_pages(), 3u);
     ASSERT_EQ(reader->CollectTreeRecords(kCatalogRootPage), 1);
     reader->ParseCatalogRecords();
-    ExpectSameItems(ExpectedItems(spec), ReadItems(*reader));
+    ExpectSameItems(ExpectedItems(layout), ReadItems(*reader));
     // The leaf scan and the harvest agree with the read rule.
     reader->ScanLeafPages();
     for (const LeafPageEntry& e : reader->leaf_pages()) {

@@ -43,10 +43,10 @@ constexpr uint32_t kNoteColumn = 257;
 
 class TempDatabase {
  public:
-  TempDatabase(const forge::DatabaseSpec& spec, const forge::DamageSpec& damage = {}) {
+  TempDatabase(const forge::DatabaseLayout& layout, const forge::FileDamage& damage = {}) {
     EXPECT_TRUE(MakeTempDir("tarnwell-lv", &dir_).ok());
     path_ = dir_ + "/test.edb";
-    Status s = forge::WriteDatabase(spec, path_, &manifest_, damage);
+    Status s = forge::WriteDatabase(layout, path_, &manifest_, damage);
     EXPECT_TRUE(s.ok()) << s.ToString();
   }
   ~TempDatabase() { std::filesystem::remove_all(dir_); }
@@ -135,11 +135,11 @@ void PrintTo(const LvParam& p, std::ostream* os) { *os << p.format.name << " " <
 
 // Records (Id, Data -> long value i, Note: a short in-record value) over
 // long values 1..n, with ids spread so that they are not consecutive.
-forge::DatabaseSpec LongValueDatabase(const Format& f, const LvCase& c) {
-  forge::DatabaseSpec spec;
-  spec.page_size = f.page_size;
-  spec.format_revision = f.revision;
-  forge::TableSpec t;
+forge::DatabaseLayout LongValueDatabase(const Format& f, const LvCase& c) {
+  forge::DatabaseLayout layout;
+  layout.page_size = f.page_size;
+  layout.format_revision = f.revision;
+  forge::TableLayout t;
   t.name = "Attachments";
   t.columns = {{kIdColumn, "Id", forge::kColumnLong},
                {kDataColumn, "Data", forge::kColumnLongBinary},
@@ -149,30 +149,30 @@ forge::DatabaseSpec LongValueDatabase(const Format& f, const LvCase& c) {
   t.max_long_value_nodes_per_leaf = c.nodes_per_leaf;
   t.max_long_value_children_per_branch = c.children_per_branch;
   for (uint32_t i = 0; i < c.values; ++i) {
-    forge::LongValueSpec v;
+    forge::LongValueLayout v;
     // 8-byte ids use the high half, which a reader that cuts ids to 4 bytes loses.
     v.id = c.id_size == 8 ? (uint64_t(i + 1) << 32) + 7 * i + 1 : 3 * i + 2;
     const size_t size = c.size + 37 * i;
     v.data = c.compression == forge::Compression::kSevenBitUnicode ? Utf16Bytes(v.id, size)
                                                                    : TextBytes(v.id, size);
     v.compression = c.compression;
-    forge::RowSpec row;
+    forge::RowLayout row;
     row.cells.push_back({kIdColumn, forge::LittleEndian(i + 1, 4)});
     row.cells.push_back(forge::SeparatedCell(kDataColumn, v.id, c.id_size));
     row.cells.push_back({kNoteColumn, forge::Ascii("note " + std::to_string(i + 1))});
     t.rows.push_back(std::move(row));
     t.long_values.push_back(std::move(v));
   }
-  spec.tables.push_back(std::move(t));
-  return spec;
+  layout.tables.push_back(std::move(t));
+  return layout;
 }
 
 class LongValueTest : public ::testing::TestWithParam<LvParam> {};
 
 TEST_P(LongValueTest, ReaderAssemblesEveryValue) {
   const LvParam& p = GetParam();
-  forge::DatabaseSpec spec = LongValueDatabase(p.format, p.lv);
-  TempDatabase db(spec);
+  forge::DatabaseLayout layout = LongValueDatabase(p.format, p.lv);
+  TempDatabase db(layout);
   const forge::TableManifest& m = db.manifest().tables[0];
   ASSERT_NE(m.long_value_root_page, 0u);
   if (p.lv.want_branches) {
@@ -192,14 +192,14 @@ TEST_P(LongValueTest, ReaderAssemblesEveryValue) {
   EXPECT_EQ(table->long_value->root_page(), m.long_value_root_page);
 
   // Straight through the long-value reader.
-  const forge::TableSpec& t = spec.tables[0];
+  const forge::TableLayout& t = layout.tables[0];
   const uint32_t chunk_size = p.lv.chunk_size
                                   ? p.lv.chunk_size
                                   : forge::DefaultLongValueChunkSize(
                                         {p.format.page_size, p.format.revision, 0}, p.lv.id_size);
   const LongValueReader lvs = reader->long_values();
   uint64_t compressed = 0;
-  for (const forge::LongValueSpec& v : t.long_values) {
+  for (const forge::LongValueLayout& v : t.long_values) {
     LongValue lv;
     ASSERT_EQ(lvs.Read(m.long_value_root_page, forge::LongValueId(v.id, p.lv.id_size), &lv), 0)
         << "id " << v.id;
@@ -277,13 +277,13 @@ TEST_P(MissingChunkTest, ValueIsTruncatedAtTheGap) {
   constexpr uint32_t kChunk = 800;
   constexpr uint32_t kChunks = 10;
   LvCase c = {"", 3, kChunk * kChunks, kChunk, 4, p.drop.compression, 0, 0, false};
-  forge::DatabaseSpec spec = LongValueDatabase(p.format, c);
+  forge::DatabaseLayout layout = LongValueDatabase(p.format, c);
   // Every value the same length, so every one has exactly kChunks chunks.
-  for (forge::LongValueSpec& v : spec.tables[0].long_values) v.data.resize(kChunk * kChunks);
-  const forge::LongValueSpec& damaged = spec.tables[0].long_values[1];
-  forge::DamageSpec damage;
+  for (forge::LongValueLayout& v : layout.tables[0].long_values) v.data.resize(kChunk * kChunks);
+  const forge::LongValueLayout& damaged = layout.tables[0].long_values[1];
+  forge::FileDamage damage;
   damage.dropped_chunks.push_back({"Attachments", damaged.id, p.drop.dropped});
-  TempDatabase db(spec, damage);
+  TempDatabase db(layout, damage);
   EXPECT_EQ(db.manifest().tables[0].long_value_chunks, 3 * kChunks - 1);
 
   auto reader = OpenWithCatalog(db.path());
@@ -305,7 +305,7 @@ TEST_P(MissingChunkTest, ValueIsTruncatedAtTheGap) {
 
   // The neighbours are whole.
   for (size_t i : {0, 2}) {
-    const forge::LongValueSpec& v = spec.tables[0].long_values[i];
+    const forge::LongValueLayout& v = layout.tables[0].long_values[i];
     LongValue whole;
     ASSERT_EQ(lvs.Read(root, forge::LongValueId(v.id), &whole), 0);
     EXPECT_FALSE(whole.truncated);

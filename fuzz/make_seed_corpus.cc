@@ -132,10 +132,10 @@ void WriteDatabases(Corpus* corpus) {
     options.rows = kSeedRows;
     options.max_rows_per_leaf = kRowsPerLeaf;
     options.max_children_per_branch = kChildrenPerBranch;
-    const forge::DatabaseSpec spec = forge::SampleDatabase(options);
+    const forge::DatabaseLayout layout = forge::SampleDatabase(options);
     forge::Manifest manifest;
     Status s;
-    const Bytes db = forge::BuildDatabase(spec, &manifest, {}, &s);
+    const Bytes db = forge::BuildDatabase(layout, &manifest, {}, &s);
     if (!s.ok()) {
       corpus->Fail(std::string(seed.name) + ": " + s.message());
       continue;
@@ -143,14 +143,14 @@ void WriteDatabases(Corpus* corpus) {
     const std::string base = seed.name;
     corpus->Put("database", base + "_inspect", WithTrailer(db, kModeInspect));
     corpus->Put("database", base + "_exchange", WithTrailer(db, seed.version));
-    forge::DamageSpec junk;
+    forge::FileDamage junk;
     junk.junk_prefix = kJunkPrefix;
     corpus->Put("database", base + "_junk",
-                WithTrailer(forge::BuildDatabase(spec, nullptr, junk), seed.version));
-    forge::DamageSpec headless;
+                WithTrailer(forge::BuildDatabase(layout, nullptr, junk), seed.version));
+    forge::FileDamage headless;
     headless.drop_header_pages = true;
     corpus->Put("database", base + "_headless",
-                WithTrailer(forge::BuildDatabase(spec, nullptr, headless), seed.version));
+                WithTrailer(forge::BuildDatabase(layout, nullptr, headless), seed.version));
 
     corpus->Put("catalog", base, CatalogRecords(db));
 
@@ -165,16 +165,16 @@ void WriteDatabases(Corpus* corpus) {
   }
 }
 
-std::vector<forge::ColumnSpec> FuzzColumnSpecs() {
-  std::vector<forge::ColumnSpec> columns;
+std::vector<forge::ColumnLayout> FuzzColumnSpecs() {
+  std::vector<forge::ColumnLayout> columns;
   for (const fuzz::FuzzColumn& c : fuzz::kFuzzColumns) {
-    forge::ColumnSpec spec;
-    spec.id = c.id;
-    spec.name = c.name;
-    spec.type = c.type;
-    spec.size = c.size;
-    spec.codepage = c.code_page;
-    columns.push_back(spec);
+    forge::ColumnLayout layout;
+    layout.id = c.id;
+    layout.name = c.name;
+    layout.type = c.type;
+    layout.size = c.size;
+    layout.codepage = c.code_page;
+    columns.push_back(layout);
   }
   return columns;
 }
@@ -240,7 +240,7 @@ std::vector<std::vector<forge::Cell>> SeedRows(bool large) {
 }
 
 void WriteRecords(Corpus* corpus) {
-  const std::vector<forge::ColumnSpec> columns = FuzzColumnSpecs();
+  const std::vector<forge::ColumnLayout> columns = FuzzColumnSpecs();
   const struct {
     forge::TaggedLayout layout;
     uint8_t form;

@@ -1,4 +1,4 @@
-// The in-memory writer: a DatabaseSpec's tables, their long values and the
+// The in-memory writer: a DatabaseLayout's tables, their long values and the
 // damage asked for, through a DatabaseWriter into one buffer. The file's
 // layout is described in forge_database.cc.
 #include "testing/ese_writer.h"
@@ -18,11 +18,11 @@ namespace {
 
 constexpr uint8_t kJunkSeed = 0x5A;
 
-Status CheckSpec(const DatabaseSpec& spec) {
-  Status s = CheckFormat(spec);
+Status CheckLayout(const DatabaseLayout& layout) {
+  Status s = CheckFormat(layout);
   if (!s.ok()) return s;
   std::set<std::string> names = {"MSysObjects", "MSysObjectsShadow"};
-  for (const TableSpec& t : spec.tables) {
+  for (const TableLayout& t : layout.tables) {
     if (t.name.empty()) return Status::InvalidArgument("a table without a name");
     if (!names.insert(t.name).second) {
       return Status::InvalidArgument("table " + t.name + " appears twice");
@@ -39,9 +39,10 @@ Bytes OrdinalKey(size_t ordinal) {
   return key;
 }
 
-Status TableEntries(const TableSpec& table, TaggedLayout layout, std::vector<TreeEntry>* entries) {
+Status TableEntries(const TableLayout& table, TaggedLayout layout,
+                    std::vector<TreeEntry>* entries) {
   for (size_t i = 0; i < table.rows.size(); ++i) {
-    const RowSpec& row = table.rows[i];
+    const RowLayout& row = table.rows[i];
     TreeEntry e;
     e.key = row.key.empty() ? OrdinalKey(i + 1) : row.key;
     e.deleted = row.deleted;
@@ -57,16 +58,18 @@ Status TableEntries(const TableSpec& table, TaggedLayout layout, std::vector<Tre
   return Status::Ok();
 }
 
-Status LongValueEntries(const TableSpec& table, const PageFormat& format, const DamageSpec& damage,
-                        std::vector<TreeEntry>* entries, LongValueCounts* counts) {
+Status LongValueEntries(const TableLayout& table, const PageFormat& format,
+                        const FileDamage& damage, std::vector<TreeEntry>* entries,
+                        LongValueCounts* counts) {
   const uint32_t chunk_size = table.long_value_chunk_size
                                   ? table.long_value_chunk_size
                                   : DefaultLongValueChunkSize(format, table.long_value_id_size);
-  std::vector<const LongValueSpec*> values;
-  for (const LongValueSpec& v : table.long_values) values.push_back(&v);
-  std::stable_sort(values.begin(), values.end(),
-                   [](const LongValueSpec* a, const LongValueSpec* b) { return a->id < b->id; });
-  for (const LongValueSpec* v : values) {
+  std::vector<const LongValueLayout*> values;
+  for (const LongValueLayout& v : table.long_values) values.push_back(&v);
+  std::stable_sort(
+      values.begin(), values.end(),
+      [](const LongValueLayout* a, const LongValueLayout* b) { return a->id < b->id; });
+  for (const LongValueLayout* v : values) {
     std::optional<uint32_t> dropped;
     for (const DroppedChunk& d : damage.dropped_chunks) {
       if (d.table == table.name && d.long_value_id == v->id) dropped = d.chunk;
@@ -88,15 +91,16 @@ Status WriteTree(DatabaseWriter* db, const TreeOptions& options,
   return writer.Finish(layout);
 }
 
-Status Build(const DatabaseSpec& spec, const DamageSpec& damage, Manifest* manifest, Bytes* out) {
-  Status s = CheckSpec(spec);
+Status Build(const DatabaseLayout& layout, const FileDamage& damage, Manifest* manifest,
+             Bytes* out) {
+  Status s = CheckLayout(layout);
   if (!s.ok()) return s;
   PageMap pages;
   PageMapSink sink(&pages);
-  DatabaseWriter db(spec, &sink);
+  DatabaseWriter db(layout, &sink);
   std::map<std::string, LongValueCounts> counts;
 
-  for (const TableSpec& table : spec.tables) {
+  for (const TableLayout& table : layout.tables) {
     std::vector<TreeEntry> entries;
     s = TableEntries(table, db.layout(), &entries);
     if (!s.ok()) return s;
@@ -129,11 +133,11 @@ Status Build(const DatabaseSpec& spec, const DamageSpec& damage, Manifest* manif
   Manifest local;
   s = db.Finish(&header, &local);
   if (!s.ok()) return s;
-  out->assign(size_t(db.total_pages() + 2) * spec.page_size, 0);
+  out->assign(size_t(db.total_pages() + 2) * layout.page_size, 0);
   std::copy(header.begin(), header.end(), out->begin());
-  std::copy(header.begin(), header.end(), out->begin() + spec.page_size);
+  std::copy(header.begin(), header.end(), out->begin() + layout.page_size);
   for (const auto& [number, image] : pages) {
-    std::copy(image.begin(), image.end(), out->begin() + size_t(number + 1) * spec.page_size);
+    std::copy(image.begin(), image.end(), out->begin() + size_t(number + 1) * layout.page_size);
   }
   if (manifest) {
     *manifest = std::move(local);
@@ -148,7 +152,7 @@ Status Build(const DatabaseSpec& spec, const DamageSpec& damage, Manifest* manif
   return Status::Ok();
 }
 
-void ApplyDamage(const DamageSpec& damage, uint32_t page_size, Bytes* file) {
+void ApplyDamage(const FileDamage& damage, uint32_t page_size, Bytes* file) {
   if (damage.drop_header_pages) {
     file->erase(file->begin(), file->begin() + std::min<size_t>(file->size(), 2 * page_size));
   }
@@ -165,20 +169,20 @@ void ApplyDamage(const DamageSpec& damage, uint32_t page_size, Bytes* file) {
 
 }  // namespace
 
-Bytes BuildDatabase(const DatabaseSpec& spec, Manifest* manifest, const DamageSpec& damage,
+Bytes BuildDatabase(const DatabaseLayout& layout, Manifest* manifest, const FileDamage& damage,
                     Status* status) {
   Bytes file;
-  Status s = Build(spec, damage, manifest, &file);
+  Status s = Build(layout, damage, manifest, &file);
   if (status) *status = s;
   if (!s.ok()) return Bytes();
-  ApplyDamage(damage, spec.page_size, &file);
+  ApplyDamage(damage, layout.page_size, &file);
   return file;
 }
 
-Status WriteDatabase(const DatabaseSpec& spec, const std::string& path, Manifest* manifest,
-                     const DamageSpec& damage) {
+Status WriteDatabase(const DatabaseLayout& layout, const std::string& path, Manifest* manifest,
+                     const FileDamage& damage) {
   Status s;
-  Bytes file = BuildDatabase(spec, manifest, damage, &s);
+  Bytes file = BuildDatabase(layout, manifest, damage, &s);
   if (!s.ok()) return s;
   std::FILE* f = std::fopen(path.c_str(), "wb");
   if (!f) return Status::IoError("cannot create " + path);

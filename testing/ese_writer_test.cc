@@ -108,31 +108,31 @@ INSTANTIATE_TEST_SUITE_P(Exchange, EseWriterFormatTest,
                          });
 
 TEST(EseWriterTest, DamageMovesOrDropsTheHeader) {
-  DatabaseSpec spec = SampleDatabase({4096, 9, 10});
+  DatabaseLayout layout = SampleDatabase({4096, 9, 10});
   Manifest manifest;
-  Bytes clean = BuildDatabase(spec, &manifest);
+  Bytes clean = BuildDatabase(layout, &manifest);
   ASSERT_FALSE(clean.empty());
 
-  Bytes junk = BuildDatabase(spec, nullptr, {1000, false, {}});
+  Bytes junk = BuildDatabase(layout, nullptr, {1000, false, {}});
   ASSERT_EQ(junk.size(), clean.size() + 1000);
   EXPECT_TRUE(std::equal(clean.begin(), clean.end(), junk.begin() + 1000));
 
-  Bytes headless = BuildDatabase(spec, nullptr, {0, true, {}});
+  Bytes headless = BuildDatabase(layout, nullptr, {0, true, {}});
   ASSERT_EQ(headless.size(), clean.size() - 2 * 4096);
   EXPECT_TRUE(std::equal(headless.begin(), headless.end(), clean.begin() + 2 * 4096));
   EXPECT_EQ(LoadU32LE(headless.data() + 36), 0x0803u) << "file should start with page 1";
 }
 
 TEST(EseWriterTest, RejectsImpossibleSpecs) {
-  DatabaseSpec good = SampleDatabase({8192, 12, 5});
-  std::vector<DatabaseSpec> bad(4, good);
+  DatabaseLayout good = SampleDatabase({8192, 12, 5});
+  std::vector<DatabaseLayout> bad(4, good);
   bad[0].page_size = 2048;
   bad[1].page_size = 32768;  // large pages need revision 17
   bad[2].tables.push_back(bad[2].tables[0]);
   bad[3].tables[0].rows[0].cells.push_back({4, Bytes{1}});  // the same column twice
-  for (const DatabaseSpec& spec : bad) {
+  for (const DatabaseLayout& layout : bad) {
     Status s;
-    EXPECT_TRUE(BuildDatabase(spec, nullptr, {}, &s).empty());
+    EXPECT_TRUE(BuildDatabase(layout, nullptr, {}, &s).empty());
     EXPECT_FALSE(s.ok());
   }
 }
@@ -146,17 +146,17 @@ TEST(EseWriterTest, DefaultFlagsFollowTheFormat) {
 
 TEST(EseWriterTest, WritesTheFile) {
   const std::string path = ::testing::TempDir() + "/forge_write_test.edb";
-  DatabaseSpec spec = SampleDatabase({8192, 12, 30});
-  ASSERT_TRUE(WriteDatabase(spec, path).ok());
+  DatabaseLayout layout = SampleDatabase({8192, 12, 30});
+  ASSERT_TRUE(WriteDatabase(layout, path).ok());
   std::FILE* f = std::fopen(path.c_str(), "rb");
   ASSERT_NE(f, nullptr);
-  Bytes read(BuildDatabase(spec).size() + 1);
+  Bytes read(BuildDatabase(layout).size() + 1);
   EXPECT_EQ(std::fread(read.data(), 1, read.size(), f), read.size() - 1);
   std::fclose(f);
   read.pop_back();
-  EXPECT_EQ(read, BuildDatabase(spec));
+  EXPECT_EQ(read, BuildDatabase(layout));
   std::remove(path.c_str());
-  EXPECT_FALSE(WriteDatabase(spec, "/nonexistent-dir/x.edb").ok());
+  EXPECT_FALSE(WriteDatabase(layout, "/nonexistent-dir/x.edb").ok());
 }
 
 }  // namespace

@@ -83,7 +83,7 @@ std::string Utf16ToUtf8(const Bytes& b) {
 }
 
 // How esedbexport 20181229 prints a value of each column type.
-std::string ExportText(const ColumnSpec& column, const Bytes& v) {
+std::string ExportText(const ColumnLayout& column, const Bytes& v) {
   char buf[64];
   switch (column.type) {
     case kColumnBit:
@@ -121,13 +121,13 @@ std::string ExportText(const ColumnSpec& column, const Bytes& v) {
   }
 }
 
-std::string ExpectedExport(const TableSpec& table) {
+std::string ExpectedExport(const TableLayout& table) {
   std::string out;
   for (size_t i = 0; i < table.columns.size(); ++i) {
     out += (i ? "\t" : "") + table.columns[i].name;
   }
   out += "\n";
-  for (const RowSpec& row : table.rows) {
+  for (const RowLayout& row : table.rows) {
     if (row.deleted) continue;
     for (size_t i = 0; i < table.columns.size(); ++i) {
       if (i) out += "\t";
@@ -177,11 +177,11 @@ TEST_P(EsedbExportTest, LibesedbExportsWhatWasWritten) {
   options.rows = c.rows;
   options.max_rows_per_leaf = c.rows_per_leaf;
   options.max_children_per_branch = c.children_per_branch;
-  DatabaseSpec spec = SampleDatabase(options);
+  DatabaseLayout layout = SampleDatabase(options);
   if (c.revision <= 2) {
     // libesedb 20181229 reads only the first of several revision-2 tagged
     // values correctly, so keep one per row there.
-    for (RowSpec& row : spec.tables[0].rows) {
+    for (RowLayout& row : layout.tables[0].rows) {
       bool has_body = false;
       for (const Cell& cell : row.cells) has_body |= cell.column_id == 256;
       if (has_body)
@@ -190,7 +190,7 @@ TEST_P(EsedbExportTest, LibesedbExportsWhatWasWritten) {
   }
   const fs::path edb = dir_ / "sample.edb";
   Manifest manifest;
-  ASSERT_TRUE(WriteDatabase(spec, edb.string(), &manifest).ok());
+  ASSERT_TRUE(WriteDatabase(layout, edb.string(), &manifest).ok());
   if (c.rows_per_leaf) {
     EXPECT_GT(manifest.tables[0].branch_pages.size(), 1u) << "want several branch levels";
   }
@@ -201,7 +201,7 @@ TEST_P(EsedbExportTest, LibesedbExportsWhatWasWritten) {
   const std::string info = ReadText(info_log);
   EXPECT_NE(info.find("Page size:\t\t" + std::to_string(c.page_size) + " bytes"), std::string::npos)
       << info;
-  EXPECT_NE(info.find("Number of tables:\t" + std::to_string(spec.tables.size() + 2)),
+  EXPECT_NE(info.find("Number of tables:\t" + std::to_string(layout.tables.size() + 2)),
             std::string::npos)
       << info;
 
@@ -214,10 +214,10 @@ TEST_P(EsedbExportTest, LibesedbExportsWhatWasWritten) {
   const fs::path exported = dir_ / "out.export";
 
   // Tables come out in object id order: the catalog and its shadow first.
-  for (size_t t = 0; t < spec.tables.size(); ++t) {
-    const fs::path file = exported / (spec.tables[t].name + "." + std::to_string(t + 2));
+  for (size_t t = 0; t < layout.tables.size(); ++t) {
+    const fs::path file = exported / (layout.tables[t].name + "." + std::to_string(t + 2));
     ASSERT_TRUE(fs::exists(file)) << file;
-    EXPECT_EQ(ReadText(file), ExpectedExport(spec.tables[t])) << spec.tables[t].name;
+    EXPECT_EQ(ReadText(file), ExpectedExport(layout.tables[t])) << layout.tables[t].name;
   }
 
   // The catalog lists every table and column by name, and the shadow agrees.
@@ -242,12 +242,12 @@ TEST_P(EsedbExportTest, LibesedbExportsWhatWasWritten) {
     names.push_back(name_column < fields.size() ? fields[name_column] : "");
   }
   std::vector<std::string> expected = {"MSysObjects"};
-  for (const ColumnSpec& col : CatalogColumns(c.revision)) expected.push_back(col.name);
+  for (const ColumnLayout& col : CatalogColumns(c.revision)) expected.push_back(col.name);
   expected.push_back("MSysObjectsShadow");
-  for (const ColumnSpec& col : CatalogColumns(c.revision)) expected.push_back(col.name);
-  for (const TableSpec& t : spec.tables) {
+  for (const ColumnLayout& col : CatalogColumns(c.revision)) expected.push_back(col.name);
+  for (const TableLayout& t : layout.tables) {
     expected.push_back(t.name);
-    for (const ColumnSpec& col : t.columns) expected.push_back(col.name);
+    for (const ColumnLayout& col : t.columns) expected.push_back(col.name);
   }
   EXPECT_EQ(names, expected);
 }
@@ -296,31 +296,31 @@ class EsedbExportLongValueTest : public ::testing::TestWithParam<LongValueExport
 
 TEST_P(EsedbExportLongValueTest, LibesedbExportsTheLongValuesBytes) {
   const LongValueExportCase& c = GetParam();
-  DatabaseSpec spec;
-  spec.page_size = c.page_size;
-  spec.format_revision = c.revision;
+  DatabaseLayout layout;
+  layout.page_size = c.page_size;
+  layout.format_revision = c.revision;
   std::vector<Bytes> values;
   for (uint32_t t = 0; t < 3; ++t) {
-    TableSpec table;
+    TableLayout table;
     table.name = "Attachments" + std::to_string(t + 1);
     table.columns = {{1, "Id", kColumnLong}, {256, "Data", kColumnLongBinary}};
     table.max_long_value_nodes_per_leaf = 1;
     table.long_value_full_leaf_prefix = true;
-    LongValueSpec lv;
+    LongValueLayout lv;
     lv.id = 0x10203 + t;  // several key bytes, not only the last, must come out right
     for (uint32_t i = 0; i < 900 + 50 * t; ++i) lv.data.push_back(uint8_t(i * 13 + t));
     values.push_back(lv.data);
-    RowSpec with_lv;
+    RowLayout with_lv;
     with_lv.cells = {{1, LittleEndian(1, 4)}, SeparatedCell(256, lv.id)};
-    RowSpec inline_value;
+    RowLayout inline_value;
     inline_value.cells = {{1, LittleEndian(2, 4)}, {256, Bytes{0xCA, 0xFE}}};
     table.rows = {with_lv, inline_value};
     table.long_values.push_back(std::move(lv));
-    spec.tables.push_back(std::move(table));
+    layout.tables.push_back(std::move(table));
   }
   const fs::path edb = dir_ / "lv.edb";
   Manifest manifest;
-  ASSERT_TRUE(WriteDatabase(spec, edb.string(), &manifest).ok());
+  ASSERT_TRUE(WriteDatabase(layout, edb.string(), &manifest).ok());
   for (const TableManifest& m : manifest.tables) {
     if (m.name.rfind("Attachments", 0) != 0) continue;
     EXPECT_EQ(m.long_value_leaf_pages.size(), 2u) << "the layout libesedb reads";
@@ -331,8 +331,9 @@ TEST_P(EsedbExportLongValueTest, LibesedbExportsTheLongValuesBytes) {
   ASSERT_EQ(
       RunTool("esedbexport -t '" + prefix.string() + "' '" + edb.string() + "'", log.string()), 0)
       << ReadText(log);
-  for (size_t t = 0; t < spec.tables.size(); ++t) {
-    const fs::path file = dir_ / "out.export" / (spec.tables[t].name + "." + std::to_string(t + 2));
+  for (size_t t = 0; t < layout.tables.size(); ++t) {
+    const fs::path file =
+        dir_ / "out.export" / (layout.tables[t].name + "." + std::to_string(t + 2));
     EXPECT_EQ(ReadText(file), "Id\tData\n1\t" + Hex(values[t]) + "\n2\tcafe\n") << file;
   }
 }

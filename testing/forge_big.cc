@@ -127,7 +127,7 @@ Bytes OrdinalKey(uint64_t ordinal) {
   return key;
 }
 
-Status WriteSmallTable(DatabaseWriter* db, const TableSpec& table) {
+Status WriteSmallTable(DatabaseWriter* db, const TableLayout& table) {
   TreeOptions options = db->NewTree(0);
   TreeWriter writer(db->format(), options, db->allocator(), db->sink());
   for (size_t i = 0; i < table.rows.size(); ++i) {
@@ -143,15 +143,15 @@ Status WriteSmallTable(DatabaseWriter* db, const TableSpec& table) {
   return s;
 }
 
-TableSpec FoldersTable() {
-  TableSpec t;
+TableLayout FoldersTable() {
+  TableLayout t;
   t.name = "Folders";
   t.columns = {{1, "FolderId", kColumnLong},
                {2, "MailboxId", kColumnLong},
                {3, "ParentId", kColumnLong},
                {128, "DisplayName", kColumnText, 255, kCodepageUtf16}};
   for (uint32_t i = 1; i <= kFolders; ++i) {
-    RowSpec row;
+    RowLayout row;
     row.cells = {{1, LittleEndian(i, 4)},
                  {2, LittleEndian((i - 1) % kMailboxes + 1, 4)},
                  {3, LittleEndian(i <= kMailboxes ? 0 : (i - 1) % kMailboxes + 1, 4)},
@@ -161,14 +161,14 @@ TableSpec FoldersTable() {
   return t;
 }
 
-TableSpec MailboxesTable() {
-  TableSpec t;
+TableLayout MailboxesTable() {
+  TableLayout t;
   t.name = "Mailboxes";
   t.columns = {{1, "MailboxId", kColumnLong},
                {128, "DisplayName", kColumnText, 255, kCodepageUtf16},
                {129, "Address", kColumnText, 255, kCodepageWestern}};
   for (uint32_t i = 1; i <= kMailboxes; ++i) {
-    RowSpec row;
+    RowLayout row;
     row.cells = {{1, LittleEndian(i, 4)},
                  {128, Utf16("User " + std::to_string(i))},
                  {129, Ascii("user" + std::to_string(i) + "@example.org")}};
@@ -177,7 +177,7 @@ TableSpec MailboxesTable() {
   return t;
 }
 
-std::vector<ColumnSpec> MessageColumns() {
+std::vector<ColumnLayout> MessageColumns() {
   return {{1, "MessageId", kColumnLong},
           {2, "FolderId", kColumnLong},
           {3, "Received", kColumnDateTime},
@@ -193,14 +193,14 @@ std::vector<ColumnSpec> MessageColumns() {
 
 Status WriteBigDatabase(const BigOptions& options, const std::string& path, Manifest* manifest,
                         BigResult* result) {
-  DatabaseSpec spec;
-  spec.page_size = options.page_size;
-  spec.format_revision =
+  DatabaseLayout layout;
+  layout.page_size = options.page_size;
+  layout.format_revision =
       options.revision ? options.revision : DefaultRevisionFor(options.page_size);
   const int fd = open(path.c_str(), O_CREAT | O_TRUNC | O_WRONLY, 0644);
   if (fd < 0) return Status::IoError("cannot create " + path);
-  FileSink sink(fd, spec.page_size);
-  DatabaseWriter db(spec, &sink);
+  FileSink sink(fd, layout.page_size);
+  DatabaseWriter db(layout, &sink);
   Status s = db.status();
   BigResult local;
   auto finish = [&](Status st) {
@@ -209,23 +209,23 @@ Status WriteBigDatabase(const BigOptions& options, const std::string& path, Mani
     return st;
   };
   if (!s.ok()) return finish(s);
-  for (const TableSpec& t : {MailboxesTable(), FoldersTable()}) {
+  for (const TableLayout& t : {MailboxesTable(), FoldersTable()}) {
     s = WriteSmallTable(&db, t);
     if (!s.ok()) return finish(s);
   }
 
-  const std::vector<ColumnSpec> columns = MessageColumns();
+  const std::vector<ColumnLayout> columns = MessageColumns();
   const TreeOptions table_options = db.NewTree(0);
   const TreeOptions lv_options = db.NewTree(kPageFlagLongValue);
   TreeWriter rows(db.format(), table_options, db.allocator(), db.sink());
   TreeWriter lvs(db.format(), lv_options, db.allocator(), db.sink());
   const uint32_t chunk_size = DefaultLongValueChunkSize(db.format(), kLongValueIdSize);
-  const uint64_t target_pages = options.size_mib * kMiB / spec.page_size;
+  const uint64_t target_pages = options.size_mib * kMiB / layout.page_size;
   Random rng(options.seed);
   uint64_t next_lv = 1;
   std::vector<TreeEntry> lv_entries;
   auto add_long_value = [&](Bytes data) -> Status {
-    LongValueSpec v;
+    LongValueLayout v;
     v.id = next_lv++;
     v.data = std::move(data);
     lv_entries.clear();
@@ -282,8 +282,8 @@ Status WriteBigDatabase(const BigOptions& options, const std::string& path, Mani
   s = db.Finish(&header, manifest);
   if (s.ok()) s = sink.Flush();
   if (s.ok()) s = sink.WriteAt(0, header.data(), header.size());
-  if (s.ok()) s = sink.WriteAt(spec.page_size, header.data(), header.size());
-  local.file_size = uint64_t(db.total_pages() + 2) * spec.page_size;
+  if (s.ok()) s = sink.WriteAt(layout.page_size, header.data(), header.size());
+  local.file_size = uint64_t(db.total_pages() + 2) * layout.page_size;
   if (s.ok() && ftruncate(fd, off_t(local.file_size)) != 0) {
     s = Status::IoError("cannot size " + path);
   }

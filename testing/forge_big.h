@@ -17,7 +17,7 @@
 #include <string>
 
 #include "base/status.h"
-#include "testing/forge_spec.h"
+#include "testing/forge_layout.h"
 
 namespace tarnwell::forge {
 

@@ -84,7 +84,7 @@ struct CatalogRow {
   std::string name;
 };
 
-Status AddRow(const std::vector<ColumnSpec>& columns, uint32_t revision, TaggedLayout layout,
+Status AddRow(const std::vector<ColumnLayout>& columns, uint32_t revision, TaggedLayout layout,
               const CatalogRow& row, std::vector<TreeEntry>* entries) {
   std::vector<Cell> cells = {
       {kObjidTable, LittleEndian(row.object_id, 4)},
@@ -113,8 +113,8 @@ Status AddRow(const std::vector<ColumnSpec>& columns, uint32_t revision, TaggedL
 
 }  // namespace
 
-std::vector<ColumnSpec> CatalogColumns(uint32_t revision) {
-  std::vector<ColumnSpec> columns = {
+std::vector<ColumnLayout> CatalogColumns(uint32_t revision) {
+  std::vector<ColumnLayout> columns = {
       {kObjidTable, "ObjidTable", kColumnLong},
       {kType, "Type", kColumnShort},
       {kId, "Id", kColumnLong},
@@ -154,7 +154,7 @@ std::vector<ColumnSpec> CatalogColumns(uint32_t revision) {
 Status BuildCatalogEntries(uint32_t revision, TaggedLayout layout,
                            const std::vector<CatalogTable>& tables,
                            std::vector<TreeEntry>* entries) {
-  const std::vector<ColumnSpec> catalog_columns = CatalogColumns(revision);
+  const std::vector<ColumnLayout> catalog_columns = CatalogColumns(revision);
   for (const CatalogTable& table : tables) {
     CatalogRow t;
     t.object_id = table.object_id;
@@ -168,7 +168,7 @@ Status BuildCatalogEntries(uint32_t revision, TaggedLayout layout,
     if (!s.ok()) return s;
 
     uint32_t record_offset = kRecordHeaderSize;
-    for (const ColumnSpec& column : *table.columns) {
+    for (const ColumnLayout& column : *table.columns) {
       CatalogRow c;
       c.object_id = table.object_id;
       c.type = kCatalogColumn;

@@ -8,8 +8,8 @@
 #include <vector>
 
 #include "base/status.h"
+#include "testing/forge_layout.h"
 #include "testing/forge_record.h"
-#include "testing/forge_spec.h"
 #include "testing/forge_tree.h"
 
 namespace tarnwell::forge {
@@ -28,14 +28,14 @@ struct CatalogTable {
   std::string name;
   uint32_t object_id = 0;
   uint32_t root_page = 0;
-  const std::vector<ColumnSpec>* columns = nullptr;
+  const std::vector<ColumnLayout>* columns = nullptr;
   // Long-value tree of the table; 0 when it has none.
   uint32_t long_value_object_id = 0;
   uint32_t long_value_root_page = 0;
 };
 
 // The catalog's own columns as the given format revision has them.
-std::vector<ColumnSpec> CatalogColumns(uint32_t revision);
+std::vector<ColumnLayout> CatalogColumns(uint32_t revision);
 
 // The catalog tree's entries (key order) for `tables`.
 Status BuildCatalogEntries(uint32_t revision, TaggedLayout layout,

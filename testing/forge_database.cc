@@ -99,18 +99,18 @@ void WriteSignature(uint8_t* p) {
   std::memcpy(p + kSignatureComputerName, name, std::min(sizeof(name), kComputerNameSize));
 }
 
-Bytes BuildHeader(const DatabaseSpec& spec, uint32_t last_object_id) {
-  Bytes h(spec.page_size, 0);
+Bytes BuildHeader(const DatabaseLayout& database, uint32_t last_object_id) {
+  Bytes h(database.page_size, 0);
   uint8_t* p = h.data();
   StoreU32LE(p + kHeaderSignature, kSignature);
-  StoreU32LE(p + kHeaderVersion, spec.format_version);
+  StoreU32LE(p + kHeaderVersion, database.format_version);
   StoreU32LE(p + kHeaderFileType, kFileTypeDatabase);
   StoreU64LE(p + kHeaderDbTime, kHeaderDbTimeValue);
   WriteSignature(p + kHeaderDbSignature);
-  StoreU32LE(p + kHeaderState, spec.database_state);
+  StoreU32LE(p + kHeaderState, database.database_state);
   std::memcpy(p + kHeaderAttachTime, kLogTime, 8);
   std::memcpy(p + kHeaderAttachPosition, kLogPosition, 8);
-  if (spec.database_state == kDatabaseStateClean) {
+  if (database.database_state == kDatabaseStateClean) {
     // Only a cleanly detached database records where it became consistent.
     std::memcpy(p + kHeaderConsistentPosition, kLogPosition, 8);
     std::memcpy(p + kHeaderConsistentTime, kLogTime, 8);
@@ -121,17 +121,17 @@ Bytes BuildHeader(const DatabaseSpec& spec, uint32_t last_object_id) {
   StoreU32LE(p + kHeaderLastObjectId, last_object_id);
   OsVersion os = kOsVersions[0];
   for (const OsVersion& v : kOsVersions) {
-    if (spec.format_revision >= v.min_revision) os = v;
+    if (database.format_revision >= v.min_revision) os = v;
   }
   StoreU32LE(p + kHeaderOsVersion, os.major);
   StoreU32LE(p + kHeaderOsVersion + 4, os.minor);
   StoreU32LE(p + kHeaderOsVersion + 8, os.build);
   StoreU32LE(p + kHeaderOsVersion + 12, os.service_pack);
-  StoreU32LE(p + kHeaderRevision, spec.format_revision);
-  StoreU32LE(p + kHeaderPageSize, spec.page_size);
-  StoreU32LE(p + kHeaderCreationVersion, spec.format_version);
-  StoreU32LE(p + kHeaderCreationRevision, spec.format_revision);
-  StoreU32LE(p + kHeaderChecksum, engine::ComputeHeaderChecksum(p, spec.page_size));
+  StoreU32LE(p + kHeaderRevision, database.format_revision);
+  StoreU32LE(p + kHeaderPageSize, database.page_size);
+  StoreU32LE(p + kHeaderCreationVersion, database.format_version);
+  StoreU32LE(p + kHeaderCreationRevision, database.format_revision);
+  StoreU32LE(p + kHeaderChecksum, engine::ComputeHeaderChecksum(p, database.page_size));
   return h;
 }
 
@@ -149,35 +149,35 @@ uint32_t DefaultPageFormatFlags(uint32_t page_size, uint32_t revision) {
   return revision <= kLegacyRevision ? kFlagsLegacy : kFlags4K;
 }
 
-Status CheckFormat(const DatabaseSpec& spec) {
-  const uint32_t ps = spec.page_size;
+Status CheckFormat(const DatabaseLayout& database) {
+  const uint32_t ps = database.page_size;
   if (ps != 4096 && ps != 8192 && ps != 16384 && ps != 32768) {
     return Status::InvalidArgument("page size must be 4096, 8192, 16384 or 32768");
   }
-  if (ps >= kLargePageMinimum && spec.format_revision < kLargeRevision) {
+  if (ps >= kLargePageMinimum && database.format_revision < kLargeRevision) {
     return Status::InvalidArgument("pages of 16 KiB and more need format revision 17 or later");
   }
   return Status::Ok();
 }
 
-DatabaseWriter::DatabaseWriter(const DatabaseSpec& spec, PageSink* sink)
+DatabaseWriter::DatabaseWriter(const DatabaseLayout& database, PageSink* sink)
     : sink_(sink),
       allocator_(kFirstFreePage, {kShadowCatalogRootPage}),
       next_object_id_(kFirstUserObjectId) {
-  spec_.page_size = spec.page_size;
-  spec_.format_version = spec.format_version;
-  spec_.format_revision = spec.format_revision;
-  spec_.page_format_flags = spec.page_format_flags;
-  spec_.prefix_compression = spec.prefix_compression;
-  spec_.database_state = spec.database_state;
-  spec_.catalog_revision = spec.catalog_revision;
-  status_ = CheckFormat(spec_);
-  format_.page_size = spec.page_size;
-  format_.revision = spec.format_revision;
-  format_.format_flags =
-      spec.page_format_flags.value_or(DefaultPageFormatFlags(spec.page_size, spec.format_revision));
+  database_.page_size = database.page_size;
+  database_.format_version = database.format_version;
+  database_.format_revision = database.format_revision;
+  database_.page_format_flags = database.page_format_flags;
+  database_.prefix_compression = database.prefix_compression;
+  database_.database_state = database.database_state;
+  database_.catalog_revision = database.catalog_revision;
+  status_ = CheckFormat(database_);
+  format_.page_size = database.page_size;
+  format_.revision = database.format_revision;
+  format_.format_flags = database.page_format_flags.value_or(
+      DefaultPageFormatFlags(database.page_size, database.format_revision));
   layout_ = TaggedLayoutFor(format_);
-  base_options_.prefix_compression = spec.prefix_compression;
+  base_options_.prefix_compression = database.prefix_compression;
   base_options_.db_time = kPageDbTime;
   // Single-extent trees whose parent is the database root.
   base_options_.root_header = RootPageHeader(1, kDatabaseRootPage, 0, 0);
@@ -191,7 +191,7 @@ TreeOptions DatabaseWriter::NewTree(uint32_t kind_flags) {
   return options;
 }
 
-void DatabaseWriter::AddTable(const std::string& name, const std::vector<ColumnSpec>& columns,
+void DatabaseWriter::AddTable(const std::string& name, const std::vector<ColumnLayout>& columns,
                               const TreeOptions& tree, const TreeLayout& layout,
                               const TreeOptions* lv_tree, const TreeLayout* lv_layout,
                               TableManifest* manifest_out) {
@@ -217,8 +217,8 @@ void DatabaseWriter::AddTable(const std::string& name, const std::vector<ColumnS
 
 Status DatabaseWriter::Finish(Bytes* header, Manifest* manifest) {
   if (!status_.ok()) return status_;
-  const uint32_t catalog_revision = spec_.catalog_revision.value_or(spec_.format_revision);
-  const std::vector<ColumnSpec> catalog_columns = CatalogColumns(catalog_revision);
+  const uint32_t catalog_revision = database_.catalog_revision.value_or(database_.format_revision);
+  const std::vector<ColumnLayout> catalog_columns = CatalogColumns(catalog_revision);
   std::vector<CatalogTable> catalog_tables;
   catalog_tables.push_back({"MSysObjects", kCatalogObjectId, kCatalogRootPage, &catalog_columns});
   catalog_tables.push_back(
@@ -284,9 +284,9 @@ Status DatabaseWriter::Finish(Bytes* header, Manifest* manifest) {
   s = write_tree({});
   if (!s.ok()) return s;
 
-  *header = BuildHeader(spec_, next_object_id_ - 1);
+  *header = BuildHeader(database_, next_object_id_ - 1);
   if (manifest) {
-    manifest->page_size = spec_.page_size;
+    manifest->page_size = database_.page_size;
     manifest->total_pages = total_pages_;
   }
   return Status::Ok();

@@ -16,16 +16,16 @@
 #include "base/byte_view.h"
 #include "base/status.h"
 #include "testing/forge_catalog.h"
+#include "testing/forge_layout.h"
 #include "testing/forge_record.h"
-#include "testing/forge_spec.h"
 #include "testing/forge_tree.h"
 
 namespace tarnwell::forge {
 
 class DatabaseWriter {
  public:
-  // Uses the format fields of `spec`; its tables are the caller's business.
-  DatabaseWriter(const DatabaseSpec& spec, PageSink* sink);
+  // Uses the format fields of `database`; its tables are the caller's business.
+  DatabaseWriter(const DatabaseLayout& database, PageSink* sink);
 
   // Why the format cannot be written; Ok when it can.
   const Status& status() const { return status_; }
@@ -40,7 +40,7 @@ class DatabaseWriter {
 
   // A finished table for the catalog. `long_values` may be null. The
   // columns are copied.
-  void AddTable(const std::string& name, const std::vector<ColumnSpec>& columns,
+  void AddTable(const std::string& name, const std::vector<ColumnLayout>& columns,
                 const TreeOptions& tree, const TreeLayout& layout, const TreeOptions* lv_tree,
                 const TreeLayout* lv_layout, TableManifest* manifest_out = nullptr);
 
@@ -54,12 +54,12 @@ class DatabaseWriter {
  private:
   struct Table {
     std::string name;
-    std::vector<ColumnSpec> columns;
+    std::vector<ColumnLayout> columns;
     CatalogTable catalog;
     TableManifest manifest;
   };
 
-  DatabaseSpec spec_;  // format fields only
+  DatabaseLayout database_;  // format fields only
   PageSink* sink_;
   PageFormat format_;
   TaggedLayout layout_;
@@ -72,7 +72,7 @@ class DatabaseWriter {
 };
 
 // Rejects formats the writer cannot produce.
-Status CheckFormat(const DatabaseSpec& spec);
+Status CheckFormat(const DatabaseLayout& database);
 
 }  // namespace tarnwell::forge
 

@@ -48,7 +48,7 @@ Bytes LongValueChunkKey(uint64_t id, uint32_t id_size, uint32_t offset) {
   return key;
 }
 
-Status AppendLongValueEntries(const LongValueSpec& value, uint32_t id_size, uint32_t chunk_size,
+Status AppendLongValueEntries(const LongValueLayout& value, uint32_t id_size, uint32_t chunk_size,
                               std::optional<uint32_t> dropped, std::vector<TreeEntry>* out,
                               LongValueCounts* counts) {
   const std::string what = "long value " + std::to_string(value.id);

@@ -9,8 +9,8 @@
 
 #include "base/byte_view.h"
 #include "base/status.h"
+#include "testing/forge_layout.h"
 #include "testing/forge_page.h"
-#include "testing/forge_spec.h"
 #include "testing/forge_tree.h"
 
 namespace tarnwell::forge {
@@ -32,7 +32,7 @@ struct LongValueCounts {
 
 // Appends the tree entries of one long value (root node, then its chunks in
 // offset order), leaving out chunk `dropped` when given.
-Status AppendLongValueEntries(const LongValueSpec& value, uint32_t id_size, uint32_t chunk_size,
+Status AppendLongValueEntries(const LongValueLayout& value, uint32_t id_size, uint32_t chunk_size,
                               std::optional<uint32_t> dropped, std::vector<TreeEntry>* out,
                               LongValueCounts* counts);
 

@@ -27,7 +27,7 @@
 #include <cstring>
 
 #include "engine/page_checksum.h"
-#include "testing/forge_spec.h"
+#include "testing/forge_layout.h"
 
 namespace tarnwell::forge {
 namespace {

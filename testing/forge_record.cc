@@ -63,7 +63,7 @@ ColumnClass ClassOf(uint32_t column_id) {
   return ColumnClass::kTagged;
 }
 
-uint32_t FixedColumnWidth(const ColumnSpec& column) {
+uint32_t FixedColumnWidth(const ColumnLayout& column) {
   switch (column.type) {
     case kColumnBit:
     case kColumnUnsignedByte:
@@ -90,9 +90,9 @@ uint32_t FixedColumnWidth(const ColumnSpec& column) {
   }
 }
 
-Status CheckColumns(const std::vector<ColumnSpec>& columns) {
+Status CheckColumns(const std::vector<ColumnLayout>& columns) {
   for (size_t i = 0; i < columns.size(); ++i) {
-    const ColumnSpec& c = columns[i];
+    const ColumnLayout& c = columns[i];
     if (c.id == 0 || c.id > kLastTaggedColumnId) {
       return Status::InvalidArgument(ColumnName(c.id) + ": id out of range");
     }
@@ -107,7 +107,7 @@ Status CheckColumns(const std::vector<ColumnSpec>& columns) {
   return Status::Ok();
 }
 
-Status EncodeRecord(const std::vector<ColumnSpec>& columns, const std::vector<Cell>& cells,
+Status EncodeRecord(const std::vector<ColumnLayout>& columns, const std::vector<Cell>& cells,
                     TaggedLayout layout, Bytes* out) {
   std::map<uint32_t, const Cell*> by_id;
   for (const Cell& cell : cells) {
@@ -115,8 +115,8 @@ Status EncodeRecord(const std::vector<ColumnSpec>& columns, const std::vector<Ce
       return Status::InvalidArgument(ColumnName(cell.column_id) + ": two cells");
     }
   }
-  std::map<uint32_t, const ColumnSpec*> column_by_id;
-  for (const ColumnSpec& c : columns) column_by_id[c.id] = &c;
+  std::map<uint32_t, const ColumnLayout*> column_by_id;
+  for (const ColumnLayout& c : columns) column_by_id[c.id] = &c;
   uint32_t last_fixed = 0, last_variable = kNoVariableColumns;
   for (const auto& [id, cell] : by_id) {
     if (!column_by_id.count(id))
@@ -136,7 +136,7 @@ Status EncodeRecord(const std::vector<ColumnSpec>& columns, const std::vector<Ce
 
   // Fixed values, then their null bitmap.
   Bytes null_bitmap((last_fixed + 7) / 8, 0);
-  for (const ColumnSpec& c : columns) {
+  for (const ColumnLayout& c : columns) {
     if (c.id > last_fixed || c.id > kLastFixedColumnId) break;
     const uint32_t width = FixedColumnWidth(c);
     if (const Bytes* v = value_of(c.id)) {

@@ -8,8 +8,8 @@
 
 #include "base/byte_view.h"
 #include "base/status.h"
+#include "testing/forge_layout.h"
 #include "testing/forge_page.h"
-#include "testing/forge_spec.h"
 
 namespace tarnwell::forge {
 
@@ -25,16 +25,16 @@ enum class ColumnClass { kFixed, kVariable, kTagged };
 ColumnClass ClassOf(uint32_t column_id);
 
 // Bytes a fixed column takes in every record; 0 for types without one.
-uint32_t FixedColumnWidth(const ColumnSpec& column);
+uint32_t FixedColumnWidth(const ColumnLayout& column);
 
 // Checks a table's columns: ids unique and ascending, 1..65535, fixed
 // columns of a fixed-width type (or binary/text with a size), names set.
-Status CheckColumns(const std::vector<ColumnSpec>& columns);
+Status CheckColumns(const std::vector<ColumnLayout>& columns);
 
 // Encodes one row. `columns` must have passed CheckColumns. Columns without
 // a cell are NULL; fixed and variable columns after the last one with a
 // cell are left out of the record, as ESE does.
-Status EncodeRecord(const std::vector<ColumnSpec>& columns, const std::vector<Cell>& cells,
+Status EncodeRecord(const std::vector<ColumnLayout>& columns, const std::vector<Cell>& cells,
                     TaggedLayout layout, Bytes* out);
 
 // The value of a multi-valued tagged column (flag kTaggedMultiValued):

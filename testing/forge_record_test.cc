@@ -5,7 +5,7 @@
 namespace tarnwell::forge {
 namespace {
 
-const std::vector<ColumnSpec> kColumns = {
+const std::vector<ColumnLayout> kColumns = {
     {1, "A", kColumnLong},
     {2, "B", kColumnShort},
     {3, "C", kColumnBit},
@@ -82,7 +82,7 @@ TEST(ForgeRecordTest, RejectsCellsThatDoNotMatchTheColumns) {
 
 TEST(ForgeRecordTest, ChecksColumnDefinitions) {
   EXPECT_TRUE(CheckColumns(kColumns).ok());
-  const std::vector<std::vector<ColumnSpec>> bad = {
+  const std::vector<std::vector<ColumnLayout>> bad = {
       {{2, "A", kColumnLong}, {1, "B", kColumnLong}},  // not ascending
       {{1, "A", kColumnBinary}},                       // fixed binary without a size
       {{1, "", kColumnLong}},                          // no name

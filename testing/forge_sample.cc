@@ -32,8 +32,8 @@ Bytes Float(float f) {
   return LittleEndian(bits, 4);
 }
 
-TableSpec ItemsTable(const SampleOptions& options) {
-  TableSpec t;
+TableLayout ItemsTable(const SampleOptions& options) {
+  TableLayout t;
   t.name = "Items";
   t.max_rows_per_leaf = options.max_rows_per_leaf;
   t.max_children_per_branch = options.max_children_per_branch;
@@ -57,7 +57,7 @@ TableSpec ItemsTable(const SampleOptions& options) {
       {257, "Data", kColumnLongBinary},
   };
   for (uint32_t i = 1; i <= options.rows; ++i) {
-    RowSpec row;
+    RowLayout row;
     auto add = [&row](uint32_t id, Bytes v, uint8_t flags = 0) {
       row.cells.push_back({id, std::move(v), flags});
     };
@@ -90,8 +90,8 @@ TableSpec ItemsTable(const SampleOptions& options) {
   return t;
 }
 
-TableSpec FoldersTable() {
-  TableSpec t;
+TableLayout FoldersTable() {
+  TableLayout t;
   t.name = "Folders";
   t.columns = {
       {1, "FolderId", kColumnLong},
@@ -100,7 +100,7 @@ TableSpec FoldersTable() {
   };
   const char* names[] = {"Top of Information Store", "Inbox", "Sent Items", "Deleted Items"};
   for (uint32_t i = 0; i < 4; ++i) {
-    RowSpec row;
+    RowLayout row;
     row.cells.push_back({1, LittleEndian(i + 1, 4)});
     row.cells.push_back({2, LittleEndian(i == 0 ? 0 : 1, 4)});
     row.cells.push_back({128, Utf16(names[i])});
@@ -117,13 +117,13 @@ uint32_t DefaultRevisionFor(uint32_t page_size) {
   return 17;
 }
 
-DatabaseSpec SampleDatabase(const SampleOptions& options) {
-  DatabaseSpec spec;
-  spec.page_size = options.page_size;
-  spec.format_revision = options.revision;
-  spec.tables.push_back(ItemsTable(options));
-  spec.tables.push_back(FoldersTable());
-  return spec;
+DatabaseLayout SampleDatabase(const SampleOptions& options) {
+  DatabaseLayout layout;
+  layout.page_size = options.page_size;
+  layout.format_revision = options.revision;
+  layout.tables.push_back(ItemsTable(options));
+  layout.tables.push_back(FoldersTable());
+  return layout;
 }
 
 }  // namespace tarnwell::forge

@@ -5,7 +5,7 @@
 
 #include <cstdint>
 
-#include "testing/forge_spec.h"
+#include "testing/forge_layout.h"
 
 namespace tarnwell::forge {
 
@@ -20,7 +20,7 @@ struct SampleOptions {
 
 // Tables "Items" (every fixed type, ASCII and UTF-16 text, binary, tagged
 // text and binary; some NULLs and deleted rows) and "Folders" (a few rows).
-DatabaseSpec SampleDatabase(const SampleOptions& options);
+DatabaseLayout SampleDatabase(const SampleOptions& options);
 
 // The Exchange revision that goes with a page size: 4 KiB 9, 8 KiB 12,
 // larger 17.

@@ -17,7 +17,7 @@
 #include <algorithm>
 #include <string>
 
-#include "testing/forge_spec.h"
+#include "testing/forge_layout.h"
 
 namespace tarnwell::forge {
 namespace {

@@ -6,7 +6,7 @@
 #include <functional>
 #include <string>
 
-#include "testing/forge_spec.h"
+#include "testing/forge_layout.h"
 
 namespace tarnwell::forge {
 namespace {

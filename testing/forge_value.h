@@ -27,7 +27,7 @@
 #include <vector>
 
 #include "base/byte_view.h"
-#include "testing/forge_spec.h"
+#include "testing/forge_layout.h"
 
 namespace tarnwell::forge {
 

@@ -9,7 +9,7 @@
 //                        of it needs encoding, all of it becomes encoded words.
 //   CFieldCodeAddress    address lists: units end at blanks, quoted strings, comments and
 //                        angle addresses are whole units; a line break follows ',' and ':'.
-//                        Display names are encoded, "<addr-spec>" never is.
+//                        Display names are encoded, "<addr-layout>" never is.
 //   CFieldCodeParameter  "type/sub; attr=value": a line break follows ';'; an encoded value
 //                        stays inside double quotes.
 //   CFieldCodeBase       any other field: units as for addresses, no forced breaks.

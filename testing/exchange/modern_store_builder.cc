@@ -84,27 +84,27 @@ class Schema {
     uint32_t& next = c.slot == Slot::kFixed      ? next_fixed_
                      : c.slot == Slot::kVariable ? next_variable_
                                                  : next_tagged_;
-    ColumnSpec spec;
-    spec.id = next++;
-    spec.name = c.name;
-    spec.type = c.type;
-    spec.codepage = c.codepage;
-    if (c.slot == Slot::kFixed && c.type == kColumnBinary) spec.size = kIdSize;
-    columns_.push_back(spec);
+    ColumnLayout layout;
+    layout.id = next++;
+    layout.name = c.name;
+    layout.type = c.type;
+    layout.codepage = c.codepage;
+    if (c.slot == Slot::kFixed && c.type == kColumnBinary) layout.size = kIdSize;
+    columns_.push_back(layout);
   }
   void Seal() {
     std::sort(columns_.begin(), columns_.end(),
-              [](const ColumnSpec& a, const ColumnSpec& b) { return a.id < b.id; });
+              [](const ColumnLayout& a, const ColumnLayout& b) { return a.id < b.id; });
     for (size_t i = 0; i < columns_.size(); ++i) index_[columns_[i].name] = i;
   }
-  const ColumnSpec* Find(const std::string& name) const {
+  const ColumnLayout* Find(const std::string& name) const {
     auto it = index_.find(name);
     return it == index_.end() ? nullptr : &columns_[it->second];
   }
-  const std::vector<ColumnSpec>& columns() const { return columns_; }
+  const std::vector<ColumnLayout>& columns() const { return columns_; }
 
  private:
-  std::vector<ColumnSpec> columns_;
+  std::vector<ColumnLayout> columns_;
   std::map<std::string, size_t> index_;
   uint32_t next_fixed_ = 1;
   uint32_t next_variable_ = kFirstVariableColumnId;
@@ -351,7 +351,7 @@ class StreamTable {
   }
 
   Status AddLongValue(Bytes data, Compression compression, uint64_t* id) {
-    LongValueSpec v;
+    LongValueLayout v;
     v.id = next_lv_++;
     v.data = std::move(data);
     v.compression = compression;
@@ -392,17 +392,17 @@ class Row {
   Row(StreamTable* table, uint32_t long_value_limit, uint32_t record_budget)
       : table_(table), limit_(long_value_limit), budget_(record_budget) {}
 
-  const ColumnSpec* Column(const std::string& name) const { return table_->schema().Find(name); }
+  const ColumnLayout* Column(const std::string& name) const { return table_->schema().Find(name); }
 
   Status Put(const std::string& name, Bytes value) {
-    const ColumnSpec* c = Column(name);
+    const ColumnLayout* c = Column(name);
     if (!c) return Missing(name);
     used_ += value.size();
     cells_.push_back({c->id, std::move(value), 0});
     return Status::Ok();
   }
   Status Number(const std::string& name, uint64_t value) {
-    const ColumnSpec* c = Column(name);
+    const ColumnLayout* c = Column(name);
     if (!c) return Missing(name);
     size_t width = 4;
     if (c->type == kColumnBit) width = 1;
@@ -416,7 +416,7 @@ class Row {
   // Text in the column's code page; with `seven_bit`, stored 7-bit
   // compressed when every character allows it.
   Status Text(const std::string& name, const std::string& utf8, bool seven_bit = false) {
-    const ColumnSpec* c = Column(name);
+    const ColumnLayout* c = Column(name);
     if (!c) return Missing(name);
     const bool unicode = c->codepage == kCodePageUnicode;
     Bytes plain;
@@ -441,7 +441,7 @@ class Row {
   // the record is filling up; Xpress compressed when `compression` says so.
   Status Large(const std::string& name, Bytes value, Compression compression,
                bool* separated = nullptr) {
-    const ColumnSpec* c = Column(name);
+    const ColumnLayout* c = Column(name);
     if (!c) return Missing(name);
     Cell cell;
     const bool compressed = compression != Compression::kNone && value.size() <= limit_ &&
@@ -900,21 +900,21 @@ Status ModernWriter::Write(const std::string& path) {
   if (options_.version != kExchange2010 && options_.version != kExchange2013) {
     return Status::InvalidArgument("modern store version must be 3 or 5");
   }
-  DatabaseSpec spec;
-  spec.format_version = kFormatVersion;
-  spec.page_size = kPage32K;
-  spec.format_revision = modern_ ? kRevision2013 : kRevision2010;
-  if (modern_ && !options_.later_2013_variant) spec.catalog_revision = kEarly2013CatalogRevision;
-  limit_ =
-      options_.long_value_limit ? options_.long_value_limit : spec.page_size / kDefaultLimitDivisor;
-  budget_ = spec.page_size / kRecordBudgetDivisor;
+  DatabaseLayout layout;
+  layout.format_version = kFormatVersion;
+  layout.page_size = kPage32K;
+  layout.format_revision = modern_ ? kRevision2013 : kRevision2010;
+  if (modern_ && !options_.later_2013_variant) layout.catalog_revision = kEarly2013CatalogRevision;
+  limit_ = options_.long_value_limit ? options_.long_value_limit
+                                     : layout.page_size / kDefaultLimitDivisor;
+  budget_ = layout.page_size / kRecordBudgetDivisor;
 
   PrepareContent();
   StoreManifest& m = *manifest_;
   m = StoreManifest();
   m.version = options_.version;
-  m.page_size = spec.page_size;
-  m.revision = spec.format_revision;
+  m.page_size = layout.page_size;
+  m.revision = layout.format_revision;
   m.later_2013_variant = modern_ && options_.later_2013_variant;
   m.attachment_key_column = modern_ ? "Inid" : "Q674a";
   m.items_recorded = options_.record_items;
@@ -954,9 +954,9 @@ Status ModernWriter::Write(const std::string& path) {
 
   const int fd = open(path.c_str(), O_CREAT | O_TRUNC | O_WRONLY, 0644);
   if (fd < 0) return Status::IoError("cannot create " + path);
-  FilePageSink sink(fd, spec.page_size);
+  FilePageSink sink(fd, layout.page_size);
   Status s = [&]() -> Status {
-    DatabaseWriter db(spec, &sink);
+    DatabaseWriter db(layout, &sink);
     if (!db.status().ok()) return db.status();
     StreamTable mailbox(&db, "Mailbox", MailboxSchema(options_.version), 0);
     const uint32_t leaf = options_.max_rows_per_leaf;
@@ -1020,8 +1020,8 @@ Status ModernWriter::Write(const std::string& path) {
     st = db.Finish(&header, &pages);
     if (st.ok()) st = sink.Flush();
     if (st.ok()) st = sink.WriteAt(0, header.data(), header.size());
-    if (st.ok()) st = sink.WriteAt(spec.page_size, header.data(), header.size());
-    const off_t size = off_t(db.total_pages() + 2) * spec.page_size;
+    if (st.ok()) st = sink.WriteAt(layout.page_size, header.data(), header.size());
+    const off_t size = off_t(db.total_pages() + 2) * layout.page_size;
     if (st.ok() && ftruncate(fd, size) != 0) st = Status::IoError("cannot size " + path);
     return st;
   }();

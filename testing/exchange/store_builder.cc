@@ -72,29 +72,29 @@ class Schema {
     uint32_t& next = c.slot == Slot::kFixed      ? next_fixed_
                      : c.slot == Slot::kVariable ? next_variable_
                                                  : next_tagged_;
-    ColumnSpec spec;
-    spec.id = next++;
-    spec.name = c.name;
-    spec.type = c.type;
-    spec.codepage = c.codepage;
+    ColumnLayout layout;
+    layout.id = next++;
+    layout.name = c.name;
+    layout.type = c.type;
+    layout.codepage = c.codepage;
     // Fixed binary columns need their width; 8 is all any of ours hold.
-    if (c.slot == Slot::kFixed && c.type == kColumnBinary) spec.size = kIdSize;
-    columns_.push_back(spec);
+    if (c.slot == Slot::kFixed && c.type == kColumnBinary) layout.size = kIdSize;
+    columns_.push_back(layout);
   }
   // Ids ascending, as the catalog and the record encoder want them.
   void Seal() {
     std::sort(columns_.begin(), columns_.end(),
-              [](const ColumnSpec& a, const ColumnSpec& b) { return a.id < b.id; });
+              [](const ColumnLayout& a, const ColumnLayout& b) { return a.id < b.id; });
     for (size_t i = 0; i < columns_.size(); ++i) index_[columns_[i].name] = i;
   }
-  const ColumnSpec* Find(const std::string& name) const {
+  const ColumnLayout* Find(const std::string& name) const {
     auto it = index_.find(name);
     return it == index_.end() ? nullptr : &columns_[it->second];
   }
-  const std::vector<ColumnSpec>& columns() const { return columns_; }
+  const std::vector<ColumnLayout>& columns() const { return columns_; }
 
  private:
-  std::vector<ColumnSpec> columns_;
+  std::vector<ColumnLayout> columns_;
   std::map<std::string, size_t> index_;
   uint32_t next_fixed_ = 1;
   uint32_t next_variable_ = kFirstVariableColumnId;
@@ -253,7 +253,7 @@ Schema AttachmentSchema(int version) {
 
 // ---- Values
 
-Bytes EncodeText(const ColumnSpec& c, const std::string& utf8) {
+Bytes EncodeText(const ColumnLayout& c, const std::string& utf8) {
   if (c.codepage == kCodePageUnicode) return Utf8ToUtf16LE(utf8);
   const std::string bytes = Utf8ToCodePage(utf8, c.codepage);
   return Bytes(bytes.begin(), bytes.end());
@@ -261,13 +261,13 @@ Bytes EncodeText(const ColumnSpec& c, const std::string& utf8) {
 
 // What a reader gets back from the column: characters the code page lacks
 // come back as '?'.
-std::string RoundTrip(const ColumnSpec& c, const std::string& utf8) {
+std::string RoundTrip(const ColumnLayout& c, const std::string& utf8) {
   if (c.codepage == kCodePageUnicode) return utf8;
   const Bytes b = EncodeText(c, utf8);
   return CodePageToUtf8(ByteView(b), c.codepage);
 }
 
-Bytes EncodeTime(const ColumnSpec& c, uint64_t filetime) {
+Bytes EncodeTime(const ColumnLayout& c, uint64_t filetime) {
   Bytes b(kIdSize);
   if (c.type == kColumnBinary) {
     StoreU32BE(b.data(), uint32_t(filetime >> 32));
@@ -391,7 +391,7 @@ class StreamTable {
   // Stores `data` in the long-value tree; the id goes in the record.
   Status AddLongValue(Bytes data, uint64_t* id) {
     if (!lv_writer_) return Status::InvalidArgument(name_ + " has no long-value tree");
-    LongValueSpec v;
+    LongValueLayout v;
     v.id = next_lv_++;
     v.data = std::move(data);
     std::vector<TreeEntry> entries;
@@ -433,26 +433,26 @@ class Row {
       : table_(table), limit_(long_value_limit), budget_(record_budget) {}
 
   Status Put(const std::string& name, Bytes value) {
-    const ColumnSpec* c = Column(name);
+    const ColumnLayout* c = Column(name);
     if (!c) return Status::InvalidArgument(table_->name() + " has no column " + name);
     used_ += value.size();
     cells_.push_back({c->id, std::move(value), 0});
     return Status::Ok();
   }
   Status Text(const std::string& name, const std::string& utf8) {
-    const ColumnSpec* c = Column(name);
+    const ColumnLayout* c = Column(name);
     if (!c) return Status::InvalidArgument(table_->name() + " has no column " + name);
     return Put(name, EncodeText(*c, utf8));
   }
   Status Time(const std::string& name, uint64_t filetime) {
-    const ColumnSpec* c = Column(name);
+    const ColumnLayout* c = Column(name);
     if (!c) return Status::InvalidArgument(table_->name() + " has no column " + name);
     return Put(name, EncodeTime(*c, filetime));
   }
   // A tagged value that goes to the long-value tree when it is large or
   // the record is filling up. `separated` tells which happened.
   Status Large(const std::string& name, Bytes value, bool* separated = nullptr) {
-    const ColumnSpec* c = Column(name);
+    const ColumnLayout* c = Column(name);
     if (!c) return Status::InvalidArgument(table_->name() + " has no column " + name);
     const bool to_tree = value.size() > limit_ || used_ + value.size() > budget_;
     if (separated) *separated = to_tree;
@@ -462,7 +462,7 @@ class Row {
     if (s.ok()) cells_.push_back(SeparatedCell(c->id, id));
     return s;
   }
-  const ColumnSpec* Column(const std::string& name) const { return table_->schema().Find(name); }
+  const ColumnLayout* Column(const std::string& name) const { return table_->schema().Find(name); }
   std::vector<Cell>& cells() { return cells_; }
 
  private:
@@ -573,7 +573,7 @@ Status StoreWriter::ListCells(Row* row, const ManifestItem& item) {
 Status StoreWriter::WriteItem(size_t folder, ManifestItem item) {
   const int version = options_.version;
   // What a reader sees of the 1252 columns.
-  const ColumnSpec* sender = msg_->schema().Find("S42");
+  const ColumnLayout* sender = msg_->schema().Find("S42");
   item.sender = RoundTrip(*sender, item.sender);
   item.message_class = RoundTrip(*msg_->schema().Find("S1a"), item.message_class);
   item.subject = item.subject_prefix + item.normalized_subject;
@@ -613,7 +613,7 @@ Status StoreWriter::WriteItem(size_t folder, ManifestItem item) {
     for (const auto& [name, value] : item.strings) next(row.Text(name, value));
     for (const auto& [name, value] : item.times) next(row.Time(name, value));
     for (const auto& [name, value] : item.numbers) {
-      const ColumnSpec* c = row.Column(name);
+      const ColumnLayout* c = row.Column(name);
       if (!c) {
         next(Status::InvalidArgument("Msg has no column " + name));
         continue;
@@ -656,14 +656,14 @@ Status StoreWriter::WriteItem(size_t folder, ManifestItem item) {
       s = arow.Put(manifest_->attachment_key_column, a.key);
       next(arow.Put("N67b0", item.key));
       next(arow.Put("L65f1", LittleEndian(a.method, 4)));
-      const ColumnSpec* file = attachments_->schema().Find("S3704");
+      const ColumnLayout* file = attachments_->schema().Find("S3704");
       a.file_name = RoundTrip(*file, a.file_name);
       if (!a.display_name.empty()) next(arow.Text("S3001", a.display_name));
       if (!a.file_name.empty()) next(arow.Text("S3704", a.file_name));
       if (!a.long_file_name.empty()) next(arow.Text("S3707", a.long_file_name));
       // The name a reader keeps: the first non-empty of the two in column order.
       a.name.clear();
-      for (const ColumnSpec& c : attachments_->schema().columns()) {
+      for (const ColumnLayout& c : attachments_->schema().columns()) {
         if (!a.name.empty()) break;
         if (c.name == "S3001") a.name = a.display_name;
         if (c.name == "S3704") a.name = a.file_name;
@@ -738,34 +738,34 @@ void StoreWriter::DescribeFolders() {
 
 Status StoreWriter::Write(const std::string& path) {
   const int version = options_.version;
-  DatabaseSpec spec;
-  spec.format_version = kFormatVersion;
+  DatabaseLayout layout;
+  layout.format_version = kFormatVersion;
   switch (version) {
     case kExchange55:
-      spec.page_size = kPage4K;
-      spec.format_revision = kRevision55;
+      layout.page_size = kPage4K;
+      layout.format_revision = kRevision55;
       break;
     case kExchange2000:
-      spec.page_size = kPage4K;
-      spec.format_revision = kRevision2000;
+      layout.page_size = kPage4K;
+      layout.format_revision = kRevision2000;
       break;
     case kExchange2007:
-      spec.page_size = kPage8K;
-      spec.format_revision = kRevision2007;
+      layout.page_size = kPage8K;
+      layout.format_revision = kRevision2007;
       break;
     default:
       return Status::InvalidArgument("legacy store version must be 4, 1 or 2");
   }
-  limit_ =
-      options_.long_value_limit ? options_.long_value_limit : spec.page_size / kDefaultLimitDivisor;
-  budget_ = spec.page_size / kRecordBudgetDivisor;
+  limit_ = options_.long_value_limit ? options_.long_value_limit
+                                     : layout.page_size / kDefaultLimitDivisor;
+  budget_ = layout.page_size / kRecordBudgetDivisor;
 
   StoreManifest& m = *manifest_;
   m = StoreManifest();
   m.version = version;
   m.public_store = content_.public_store;
-  m.page_size = spec.page_size;
-  m.revision = spec.format_revision;
+  m.page_size = layout.page_size;
+  m.revision = layout.format_revision;
   m.attachment_table = content_.public_store ? "1-A" : version == kExchange2000 ? "1-23" : "1-24";
   m.attachment_key_column = version == kExchange55 ? "Q674a" : "Q3f88";
   m.items_recorded = options_.record_items;
@@ -795,9 +795,9 @@ Status StoreWriter::Write(const std::string& path) {
 
   const int fd = open(path.c_str(), O_CREAT | O_TRUNC | O_WRONLY, 0644);
   if (fd < 0) return Status::IoError("cannot create " + path);
-  FilePageSink sink(fd, spec.page_size);
+  FilePageSink sink(fd, layout.page_size);
   Status s = [&]() -> Status {
-    DatabaseWriter db(spec, &sink);
+    DatabaseWriter db(layout, &sink);
     if (!db.status().ok()) return db.status();
     StreamTable mailbox(&db, "Mailbox", MailboxSchema(), false, 0);
     StreamTable folders(&db, "Folders", FolderSchema(), false, 0);
@@ -814,7 +814,7 @@ Status StoreWriter::Write(const std::string& path) {
          {std::pair{std::string("Msg"), &msg.schema()},
           std::pair{std::string("Content"), &content_tables_.front()->schema()},
           std::pair{std::string("Folders"), &folders.schema()}}) {
-      for (const ColumnSpec& c : schema->columns()) {
+      for (const ColumnLayout& c : schema->columns()) {
         if (c.name[0] == 'T') m.time_encodings[table + "." + c.name] = TimeFormName(c.type);
       }
     }
@@ -856,8 +856,8 @@ Status StoreWriter::Write(const std::string& path) {
     st = db.Finish(&header, &pages);
     if (st.ok()) st = sink.Flush();
     if (st.ok()) st = sink.WriteAt(0, header.data(), header.size());
-    if (st.ok()) st = sink.WriteAt(spec.page_size, header.data(), header.size());
-    const off_t size = off_t(db.total_pages() + 2) * spec.page_size;
+    if (st.ok()) st = sink.WriteAt(layout.page_size, header.data(), header.size());
+    const off_t size = off_t(db.total_pages() + 2) * layout.page_size;
     if (st.ok() && ftruncate(fd, size) != 0) st = Status::IoError("cannot size " + path);
     return st;
   }();

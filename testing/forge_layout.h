@@ -1,11 +1,11 @@
 // What the test database writer is asked to build, and what it reports back.
 //
-// A DatabaseSpec is a plain description: tables, their columns and rows, and
+// A DatabaseLayout is a plain description: tables, their columns and rows, and
 // the page format of one Exchange generation. The writer turns it into an ESE
 // database file; the Manifest says where everything ended up so tests can
 // damage or inspect particular pages.
-#ifndef TARNWELL_TESTING_FORGE_SPEC_H_
-#define TARNWELL_TESTING_FORGE_SPEC_H_
+#ifndef TARNWELL_TESTING_FORGE_LAYOUT_H_
+#define TARNWELL_TESTING_FORGE_LAYOUT_H_
 
 #include <cstddef>
 #include <cstdint>
@@ -63,7 +63,7 @@ enum class Compression : uint8_t {
   kLz4,
 };
 
-struct ColumnSpec {
+struct ColumnLayout {
   uint32_t id = 0;
   std::string name;
   uint32_t type = 0;
@@ -78,7 +78,7 @@ struct Cell {
   uint8_t tagged_flags = 0;    // flag byte of a tagged value (kTagged*); 0 = none on small pages
 };
 
-struct RowSpec {
+struct RowLayout {
   std::vector<Cell> cells;
   bool deleted = false;  // written as a node with the deleted tag flag
   Bytes key;             // empty: the 4-byte big-endian ordinal of the row (1-based)
@@ -86,7 +86,7 @@ struct RowSpec {
 
 // A value of the table's long-value tree. Records refer to it by id through
 // a separated tagged value (see SeparatedCell in forge_value.h).
-struct LongValueSpec {
+struct LongValueLayout {
   uint64_t id = 0;  // unique within the table, 1 and up
   Bytes data;
   uint32_t reference_count = 1;
@@ -95,15 +95,15 @@ struct LongValueSpec {
   Compression compression = Compression::kNone;
 };
 
-struct TableSpec {
+struct TableLayout {
   std::string name;
-  std::vector<ColumnSpec> columns;
-  std::vector<RowSpec> rows;
+  std::vector<ColumnLayout> columns;
+  std::vector<RowLayout> rows;
   uint32_t max_rows_per_leaf = 0;        // 0: fill pages; small values force deep trees
   uint32_t max_children_per_branch = 0;  // 0: fill pages
 
   // The long-value tree; written (with its catalog record) when not empty.
-  std::vector<LongValueSpec> long_values;
+  std::vector<LongValueLayout> long_values;
   uint32_t long_value_id_size = 4;             // 4, or 8 as newer revisions have it
   uint32_t long_value_chunk_size = 0;          // 0: DefaultLongValueChunkSize
   uint32_t max_long_value_nodes_per_leaf = 0;  // 0: fill pages
@@ -111,7 +111,7 @@ struct TableSpec {
   bool long_value_full_leaf_prefix = false;  // see TreeOptions::full_leaf_prefix
 };
 
-struct DatabaseSpec {
+struct DatabaseLayout {
   uint32_t page_size = 8192;  // 4096, 8192, 16384 or 32768
   uint32_t format_version = 0x620;
   uint32_t format_revision = 12;
@@ -125,7 +125,7 @@ struct DatabaseSpec {
   // format_revision). 17 in a revision-20 file gives catalog records whose
   // last fixed column is 11 instead of 12, as earlier Exchange 2013 stores have.
   std::optional<uint32_t> catalog_revision;
-  std::vector<TableSpec> tables;
+  std::vector<TableLayout> tables;
 };
 
 // One chunk of one long value left out of its tree.
@@ -135,7 +135,7 @@ struct DroppedChunk {
   uint32_t chunk = 0;  // 0-based, in offset order
 };
 
-struct DamageSpec {
+struct FileDamage {
   size_t junk_prefix = 0;          // bytes of junk before the header
   bool drop_header_pages = false;  // the file starts with page 1
   std::vector<DroppedChunk> dropped_chunks;
@@ -188,4 +188,4 @@ constexpr uint32_t kShadowCatalogObjectId = 3;
 
 }  // namespace tarnwell::forge
 
-#endif  // TARNWELL_TESTING_FORGE_SPEC_H_
+#endif  // TARNWELL_TESTING_FORGE_LAYOUT_H_
