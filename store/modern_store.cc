@@ -94,23 +94,10 @@ std::string ModernFolderTableName(int version, uint64_t number) {
   char hex[24];
   std::snprintf(hex, sizeof hex, "%llx", static_cast<unsigned long long>(number));
   const std::string text = hex;
+  // The second piece is cut the way a legacy content-table name is.
   const size_t first_run = text.find("0000");
-  std::string first, second;
-  if (first_run == std::string::npos) {
-    second = text.size() > 1 ? text.substr(1) : "";
-  } else {
-    first = text.substr(0, first_run);
-    size_t last_run = std::string::npos;
-    for (size_t start = text.size() >= 4 ? text.size() - 4 : 0; start >= 1; --start) {
-      if (text.compare(start, 4, "0000") == 0) {
-        last_run = start;
-        break;
-      }
-      if (start == 1) break;
-    }
-    second = last_run == std::string::npos ? text.substr(1) : text.substr(last_run + 4);
-  }
-  for (char& c : second) c = char(std::toupper(static_cast<unsigned char>(c)));
+  const std::string first = first_run == std::string::npos ? "" : text.substr(0, first_run);
+  const std::string second = ContentTableName(number);
   return "Folders-" + first + "-" + second;
 }
 
