@@ -1,9 +1,10 @@
 #include "app/file_export_job.h"
 
+#include "app/item_render.h"
+
 #include <openssl/evp.h>
 
 #include <filesystem>
-#include <set>
 
 #include "base/paths.h"
 #include "base/text.h"
@@ -25,24 +26,6 @@ constexpr size_t kMaxNameBytes = 255;  // one file-name component on Linux
 constexpr int kPermille = 1000;
 inline constexpr char kForbidden[] = "\\/:*?\"<>|";
 inline constexpr char kTemporarySuffix[] = ".part";
-
-enum class ItemKind { kMessage, kTask, kContact, kAppointment, kDistList, kJournal, kNote };
-
-ItemKind KindOf(const std::string& message_class) {
-  const std::string& c = message_class;
-  if (c == "IPM.Contact" || c == "IPF.Contact") return ItemKind::kContact;
-  if (c == "IPM.Appointment" || c == "IPF.Appointment" || c == "IPM.Appointment.Private Calendar" ||
-      c == "IPM.Schedule.Meeting.Request") {
-    return ItemKind::kAppointment;
-  }
-  if (c == "IPM.Task" || c == "IPF.Task") return ItemKind::kTask;
-  if (c == "IPM.DistList" || c == "IPF.DistList") return ItemKind::kDistList;
-  if (c == "IPM.Activity" || c == "IPF.Activity") return ItemKind::kJournal;
-  if (c == "IPM.Post" || c == "IPF.Post" || c == "IPM.StickyNote" || c == "IPF.StickyNote") {
-    return ItemKind::kNote;
-  }
-  return ItemKind::kMessage;
-}
 
 // Control characters and the characters Windows forbids in names become
 // spaces; the result is one safe path component.
@@ -68,13 +51,6 @@ std::string CutText(const std::string& text, size_t units, size_t bytes) {
     end = pos;
   }
   return text.substr(0, end);
-}
-
-bool ParseCalendarDate(const std::string& text, CalendarDate* date) {
-  int y, mo, d, h, mi, s;
-  if (!render::ParseDateText(text, &y, &mo, &d, &h, &mi, &s)) return false;
-  *date = {y, mo, d};
-  return true;
 }
 
 std::string JoinPath(const std::vector<std::string>& path, const char* separator) {
@@ -218,58 +194,23 @@ Status RunFileExport(store::MailStore& store, const FileExportRequest& request,
     counts.found = rows.size();
     log.ItemsFound(rows.size());
     progress.Range(0, kPermille);
-    std::set<std::string> digests;  // duplicates count within one folder only
+    ItemFilter filter(options);
     uint64_t counter = 0;
     for (const store::MessageSummary& row : rows) {
       if (!running.load()) break;
       ++counter;
       progress.Position(int(counter * kPermille / rows.size()));
       progress.Stage(row.subject + " is saving");
-      const std::string date_text = !row.received.empty() ? row.received : row.created;
-      if (options.date_mode != DateMode::kAllTime) {
-        CalendarDate date;
-        if (ParseCalendarDate(date_text, &date)) {
-          bool inside = false;
-          for (const DateRange& r : options.date_ranges) inside = inside || InRange(date, r);
-          if (options.date_mode == DateMode::kInside ? !inside : inside) continue;
-        }
-      }
-      if (options.dedup_on && !digests.insert(DuplicateDigest(row, options.dedup_by)).second) {
-        continue;
-      }
-      store::DecodePurpose purpose;
-      std::optional<store::ItemRecords> item =
-          store.OpenMessage(folder.folder, row.message_key, &purpose);
-      if (!item) {
+      if (!filter.Passes(row)) continue;
+      OpenedItem item;
+      if (!OpenItem(store, folder.folder, row, text_mode, &item)) {
         log.Error("item " + std::to_string(counter) + " of " + tree_path +
                   " has no message record\r\n");
         continue;
       }
-      std::vector<store::AttachmentRecord> attachments =
-          store.ListAttachments(folder.folder, row.message_key);
-      const std::string message_class = row.message_class.empty() ? "IPM.Note" : row.message_class;
-      const ItemKind kind = KindOf(message_class);
-      render::HeaderStrings headers;
-      headers.to = row.to;
-      headers.from = row.sender;
-      headers.cc = row.cc;
-      headers.subject = row.subject;
-      headers.date_text = date_text;
-      const store::FileTime date = item->message.creation_time;
-
-      // What this item becomes: its native file, or a composed message.
-      std::string native, native_extension;
-      if (kind == ItemKind::kContact) {
-        native = render::ComposeVCard(render::ContactFromRecord(item->contact), text_mode);
-        native_extension = ".vcf";
-      } else if (kind == ItemKind::kAppointment) {
-        render::AppointmentItem a;
-        a.subject = row.subject;
-        a.created_text = row.created;
-        a.importance = row.importance;
-        native = render::ComposeICalendar(item->appointment, a, text_mode);
-        native_extension = ".ics";
-      }
+      const std::string& native = item.native;
+      const std::string& native_extension = item.native_extension;
+      const std::string date_text = item.headers.date_text;
       const bool write_native = !native.empty() && request.keep_native && !mbox;
       const std::string extension = write_native ? native_extension : ".eml";
       const std::string name = ItemFileName(row, date_text, options.name_by, counter, extension,
@@ -281,16 +222,7 @@ Status RunFileExport(store::MailStore& store, const FileExportRequest& request,
           out->Write(native);
           return out->ok() ? Status::Ok() : Status::IoError("write failed");
         }
-        if (!native.empty()) {
-          return render::ComposeCarrier(kind == ItemKind::kContact ? "text/vcard" : "text/calendar",
-                                        std::to_string(counter) + native_extension, native, date,
-                                        attachments, headers, compose, out);
-        }
-        if (kind == ItemKind::kTask) {
-          return render::ComposeTask(item->task, item->message.rtf_body, date, attachments, headers,
-                                     compose, out);
-        }
-        return render::ComposeMessage(item->message, date, attachments, headers, compose, out);
+        return ComposeItem(item, std::to_string(counter) + native_extension, compose, out);
       };
       Status s;
       if (mbox) {
