@@ -1,4 +1,5 @@
-// `tarnwell export`: the checked folders of a scanned database to files.
+// `tarnwell export`: the checked folders of a scanned database to files or
+// PST files.
 #ifndef TARNWELL_CLI_EXPORT_COMMAND_H_
 #define TARNWELL_CLI_EXPORT_COMMAND_H_
 
@@ -13,8 +14,13 @@ namespace tarnwell::cli {
 
 struct ExportCommandOptions {
   ScanOptions scan;
-  std::string to = "eml";  // eml | mbox
+  std::string to = "eml";  // eml | mbox | pst
   std::string out;
+  // PST: an existing file to add to (instead of new files in `out`), a
+  // split size ("500MB", "2GB"; empty: no split), one file per mailbox.
+  std::string existing_pst;
+  std::string split_size;
+  bool split_by_user = false;
   std::vector<std::string> folders;  // references; none: every folder
   bool hierarchy = false;
   std::string name_by = "to,from,subject,date";
@@ -30,11 +36,13 @@ struct ExportSummary {
   std::string destination;
   std::string log_path;
   uint64_t found = 0, saved = 0;
+  std::vector<std::string> pst_files;
   size_t folders = 0;
 };
 
 // Validates the options with the option pages' own messages, scans, and
-// exports. The destination is OUT/Tarnwell_<date and time>.
+// exports. The destination of files is OUT/Tarnwell_<date and time>; PST
+// files go to OUT itself.
 Status RunExport(const ExportCommandOptions& options, ProgressSink& progress,
                  ExportSummary* summary);
 

@@ -96,6 +96,7 @@ int RunExportCommand(const tarnwell::cli::ExportCommandOptions& o) {
               static_cast<unsigned long long>(summary.saved),
               static_cast<unsigned long long>(summary.found), summary.folders,
               summary.destination.c_str());
+  for (const std::string& file : summary.pst_files) std::printf("PST: %s\n", file.c_str());
   if (!summary.log_path.empty()) std::printf("Log: %s\n", summary.log_path.c_str());
   return 0;
 }
@@ -144,10 +145,15 @@ int main(int argc, char** argv) {
   show->add_flag("--json", show_json, "print JSON");
 
   tarnwell::cli::ExportCommandOptions export_options;
-  CLI::App* exp = app.add_subcommand("export", "Export folders to EML files or MBOX mailboxes");
+  CLI::App* exp = app.add_subcommand("export", "Export folders to EML files, MBOX mailboxes or PST files");
   AddScanOptions(exp, &export_options.scan);
-  exp->add_option("--to", export_options.to, "eml or mbox")->required();
-  exp->add_option("--out", export_options.out, "destination folder")->required();
+  exp->add_option("--to", export_options.to, "eml, mbox or pst")->required();
+  exp->add_option("--out", export_options.out, "destination folder");
+  exp->add_option("--existing-pst", export_options.existing_pst,
+                  "pst: add to this PST file instead of writing new ones");
+  exp->add_option("--split-size", export_options.split_size,
+                  "pst: start a new file past this size (500MB, 2GB; at least 100MB)");
+  exp->add_flag("--split-by-user", export_options.split_by_user, "pst: one file per mailbox");
   exp->add_option("--folder", export_options.folders,
                   "folder reference (repeatable; default: all)");
   exp->add_flag("--hierarchy", export_options.hierarchy,
