@@ -4,15 +4,10 @@
 
 #include <filesystem>
 #include <fstream>
-#include <map>
 
-#include "app/scan_driver.h"
-#include "base/paths.h"
-#include "base/text.h"
+#include "app/export_test_support.h"
 #include "render/eml_composer.h"
 #include "render/mime/mime_sink.h"
-#include "testing/exchange/modern_store_builder.h"
-#include "testing/exchange/store_builder.h"
 
 namespace tarnwell::app {
 namespace {
@@ -20,89 +15,14 @@ namespace {
 namespace fs = std::filesystem;
 namespace fx = forge::exchange;
 
-const std::string kChecker = std::string(TARNWELL_SOURCE_DIR) + "/app/testdata/check_export.py";
+using namespace testing_support;  // NOLINT
 
-bool HavePython() { return std::system("/usr/bin/python3 -c 'import email' 2>/dev/null") == 0; }
-
-// Runs the independent check; its report goes into the failure message.
 void CheckExport(const std::string& manifest, const std::string& dir, const std::string& mode) {
-  const std::string report = dir + ".report";
-  const std::string cmd = "/usr/bin/python3 '" + kChecker + "' '" + manifest + "' '" + dir + "' " +
-                          mode + " > '" + report + "' 2>&1";
-  const int rc = std::system(cmd.c_str());
-  std::ifstream in(report);
-  const std::string text((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
-  EXPECT_EQ(rc, 0) << text;
+  RunChecker("check_export.py", {manifest, dir, mode}, dir + ".report");
 }
 
-class Collector : public store::FolderTreeSink {
- public:
-  int64_t AddTopItem(const std::string& text, int, uint64_t) override {
-    paths_[0] = {text};
-    return 0;
-  }
-  int64_t AddFolder(int64_t parent, const std::string& text, int, uint32_t index) override {
-    return Add(parent, text, {-1, index});
-  }
-  int64_t AddMailboxFolder(int64_t parent, const std::string& text, int, int32_t mailbox,
-                           uint32_t index) override {
-    return Add(parent, text, {mailbox, index});
-  }
-  int64_t Add(int64_t parent, const std::string& text, store::FolderRef ref) {
-    ExportFolder f{ref, paths_[parent]};
-    f.path.push_back(text);
-    paths_[int64_t(folders.size()) + 1] = f.path;
-    folders.push_back(f);
-    return int64_t(folders.size());
-  }
-  std::vector<ExportFolder> folders;
-
- private:
-  std::map<int64_t, std::vector<std::string>> paths_;
-};
-
-struct StoreCase {
-  const char* name;
-  int version;
-  bool public_store;
-};
-
-class FileExportTest : public ::testing::TestWithParam<StoreCase> {
+class FileExportTest : public ScannedStoreTest {
  protected:
-  void SetUp() override {
-    if (!HavePython()) GTEST_SKIP() << "/usr/bin/python3 is needed to read the export back";
-    ASSERT_TRUE(MakeTempDir("tarnwell-export", &dir_).ok());
-    fx::StoreManifest manifest;
-    if (GetParam().version == fx::kExchange2010 || GetParam().version == fx::kExchange2013) {
-      fx::ModernStoreOptions o;
-      o.version = GetParam().version;
-      o.later_2013_variant = GetParam().version == fx::kExchange2013;
-      o.damage = fx::ModernDamageOptions::All();
-      ASSERT_TRUE(fx::BuildModernStore(o, dir_ + "/store.edb", &manifest).ok());
-    } else {
-      fx::LegacyStoreOptions o;
-      o.version = GetParam().version;
-      o.public_store = GetParam().public_store;
-      o.damage = fx::DamageOptions::All();
-      ASSERT_TRUE(fx::BuildLegacyStore(o, dir_ + "/store.edb", &manifest).ok());
-    }
-    manifest_path_ = dir_ + "/manifest.json";
-    std::ofstream(manifest_path_) << fx::ManifestJson(manifest);
-
-    RunSettings settings;
-    settings.edb_path = dir_ + "/store.edb";
-    settings.temp_root = dir_ + "/temp";
-    settings.version_code = GetParam().version;
-    ASSERT_TRUE(OpenSource(settings, 1, NullProgress(), &source_).ok());
-    RunningFlag running{true};
-    ASSERT_TRUE(RunScan(source_, 1, running, NullProgress(), tree_).tree_shown);
-  }
-  void TearDown() override {
-    source_.store.reset();
-    source_.reader.reset();
-    if (!dir_.empty()) fs::remove_all(dir_);
-  }
-
   FileExportResult Export(OutputFormat format, bool keep_native, const std::string& out) {
     FileExportRequest r;
     r.options.format = format;
@@ -117,10 +37,6 @@ class FileExportTest : public ::testing::TestWithParam<StoreCase> {
     EXPECT_TRUE(RunFileExport(*source_.store, r, running, NullProgress(), &result).ok());
     return result;
   }
-
-  std::string dir_, manifest_path_;
-  SourceEntry source_;
-  Collector tree_;
 };
 
 TEST_P(FileExportTest, EmlMboxAndNativeFilesReadBackAsTheManifestSays) {
@@ -131,10 +47,7 @@ TEST_P(FileExportTest, EmlMboxAndNativeFilesReadBackAsTheManifestSays) {
   const FileExportResult native = Export(OutputFormat::kEml, true, "native");
   CheckExport(manifest_path_, dir_ + "/native", "native");
   // Every folder logged what it found and saved.
-  std::ifstream log(native.log_path, std::ios::binary);
-  const std::string raw((std::istreambuf_iterator<char>(log)), std::istreambuf_iterator<char>());
-  const std::string text =
-      Utf16LEToUtf8(ByteView(reinterpret_cast<const uint8_t*>(raw.data()) + 2, raw.size() - 2));
+  const std::string text = ReadLog(native.log_path);
   EXPECT_NE(text.find("Save Items as:\tEML\t\r\n"), std::string::npos);
   EXPECT_NE(text.find("Items Found: "), std::string::npos);
   EXPECT_NE(text.find("Save Process Completed Successfully"), std::string::npos);
@@ -193,10 +106,7 @@ TEST_P(FileExportTest, DateFilterAndStop) {
   FileExportResult stopped = run(DateMode::kAllTime, "stopped", stopper, running);
   EXPECT_EQ(totals(stopped).second, 2u);
   EXPECT_TRUE(stopped.stopped);
-  std::ifstream log(stopped.log_path, std::ios::binary);
-  const std::string raw((std::istreambuf_iterator<char>(log)), std::istreambuf_iterator<char>());
-  const std::string text =
-      Utf16LEToUtf8(ByteView(reinterpret_cast<const uint8_t*>(raw.data()) + 2, raw.size() - 2));
+  const std::string text = ReadLog(stopped.log_path);
   size_t saved_lines = 0;
   for (size_t at = text.find("Items Saved: "); at != std::string::npos;
        at = text.find("Items Saved: ", at + 1)) {
@@ -214,7 +124,7 @@ INSTANTIATE_TEST_SUITE_P(Stores, FileExportTest,
                                            StoreCase{"v2003_public", 1, true},
                                            StoreCase{"v2010", 3, false},
                                            StoreCase{"v2013", 5, false}),
-                         [](const auto& info) { return std::string(info.param.name); });
+                         StoreCaseName);
 
 TEST(ItemFileNameTest, ForbiddenCharactersCounterAndCuts) {
   store::MessageSummary row;
