@@ -77,7 +77,8 @@ class Collector : public store::FolderTreeSink {
 struct StoreCase {
   const char* name;
   int version;
-  bool public_store;
+  bool public_store = false;
+  bool real_layout = false;  // version 5 as Exchange 2013-2019 servers write it
 };
 
 inline std::string StoreCaseName(const ::testing::TestParamInfo<StoreCase>& info) {
@@ -96,7 +97,8 @@ class ScannedStoreTest : public ::testing::TestWithParam<StoreCase> {
     if (GetParam().version == fx::kExchange2010 || GetParam().version == fx::kExchange2013) {
       fx::ModernStoreOptions o;
       o.version = GetParam().version;
-      o.later_2013_variant = GetParam().version == fx::kExchange2013;
+      o.later_2013_variant = GetParam().version == fx::kExchange2013 && !GetParam().real_layout;
+      o.real_layout = GetParam().real_layout;
       o.damage = fx::ModernDamageOptions::All();
       ASSERT_TRUE(fx::BuildModernStore(o, dir_ + "/store.edb", &manifest).ok());
     } else {

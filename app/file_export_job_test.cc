@@ -123,7 +123,8 @@ INSTANTIATE_TEST_SUITE_P(Stores, FileExportTest,
                                            StoreCase{"v2007", 2, false},
                                            StoreCase{"v2003_public", 1, true},
                                            StoreCase{"v2010", 3, false},
-                                           StoreCase{"v2013", 5, false}),
+                                           StoreCase{"v2013", 5, false},
+                                           StoreCase{"v2013_real", 5, false, true}),
                          StoreCaseName);
 
 TEST(ItemFileNameTest, ForbiddenCharactersCounterAndCuts) {

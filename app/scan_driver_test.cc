@@ -96,11 +96,16 @@ TEST_F(ScanDriverTest, StagesRunInOrderWithTheirTexts) {
   }
 }
 
-TEST(ModernScanDriverTest, MailboxesAndTheirFoldersWithoutAFolderStage) {
+// Both code-5 layouts: the documented one and the one servers write
+// (revision 110, 26-byte folder ids).
+class ModernScanDriverTest : public ::testing::TestWithParam<bool> {};
+
+TEST_P(ModernScanDriverTest, MailboxesAndTheirFoldersWithoutAFolderStage) {
   std::string dir;
   ASSERT_TRUE(MakeTempDir("tarnwell-app-modern", &dir).ok());
   fx::ModernStoreOptions options;
   options.version = fx::kExchange2013;
+  options.real_layout = GetParam();
   fx::StoreManifest manifest;
   ASSERT_TRUE(fx::BuildModernStore(options, dir + "/m.edb", &manifest).ok());
   for (bool mailboxes_only : {false, true}) {
@@ -124,6 +129,9 @@ TEST(ModernScanDriverTest, MailboxesAndTheirFoldersWithoutAFolderStage) {
   }
   std::filesystem::remove_all(dir);
 }
+
+INSTANTIATE_TEST_SUITE_P(Layouts, ModernScanDriverTest, ::testing::Bool(),
+                         [](const auto& info) { return info.param ? "real" : "documented"; });
 
 TEST_F(ScanDriverTest, OpenFailuresSayWhy) {
   Recorder progress;

@@ -24,8 +24,12 @@ const VersionInfo* FindVersion(int code) {
   return nullptr;
 }
 
+// Exchange 2013 writes revision 20; the servers after it write later ones
+// (2016 and 2019 databases carry revisions past 100) in the same layout.
+constexpr uint32_t kFirstModernRevision = 20;
+
 VersionCode VersionFromRevision(uint32_t revision) {
-  if (revision == 20) return kExchange2013;
+  if (revision >= kFirstModernRevision) return kExchange2013;
   return TemplateVersionFromRevision(revision);
 }
 

@@ -8,7 +8,9 @@
 #include "engine/catalog.h"
 #include "store/legacy_store.h"
 #include "store/property_blob.h"
-#include "store/row_values.h"
+#include "store/real_property_blob.h"
+#include "store/rtf_decompressor.h"
+#include "store/subobjects_blob.h"
 
 namespace tarnwell::store {
 namespace {
@@ -41,6 +43,7 @@ const std::vector<std::string>& ListColumns() {
                                                     "DateCreated",
                                                     "MessageClass",
                                                     "PropertyBlob",
+                                                    "OffPagePropertyBlob",
                                                     "HasAttachments",
                                                     "SubjectPrefix",
                                                     "Importance",
@@ -85,6 +88,55 @@ std::optional<uint64_t> ReadId(const RowValueReader& values, const engine::Table
   return IdOf(v, min_size);
 }
 
+bool IsBlobColumn(const std::string& name) {
+  return name == "PropertyBlob" || name == "OffPagePropertyBlob";
+}
+
+// What rows of the list take from a blob of the server layout: its other
+// list properties have columns of their own.
+const std::vector<std::string> kListBlobNames = {"S42", "Se1d", "T3008"};
+const std::vector<std::string> kFolderBlobNames = {"S3001", "S3613"};
+const std::vector<std::string> kMailboxBlobNames = {"S3001"};
+
+// Names of the fixed numbers a blob entry is decoded under.
+std::string EntryName(const BlobEntry& e, uint16_t id) {
+  char hex[8];
+  std::snprintf(hex, sizeof hex, "%x", id);
+  return e.letters + hex;
+}
+
+// The member list the decoder reads ("MN81a9") from one-off entry ids, one
+// per element: each is a member as that list has it.
+Bytes MemberList(const std::vector<Bytes>& entry_ids) {
+  constexpr uint32_t kFirstMember = 4;
+  Bytes out(kFirstMember);
+  StoreU32LE(out.data(), kFirstMember);
+  for (const Bytes& id : entry_ids) out.insert(out.end(), id.begin(), id.end());
+  return out;
+}
+
+// The row's "SeparatedPropertyNN" values, read as asked for.
+class RowSeparatedValues {
+ public:
+  RowSeparatedValues(const RowValueReader& values, const engine::TableDef& table,
+                     const engine::RecordColumns& columns)
+      : values_(values), table_(table), columns_(columns) {}
+  std::optional<Bytes> operator()(uint16_t slot) const {
+    const int at = ColumnSlot(table_, SeparatedPropertyColumn(slot));
+    RowValue v;
+    if (at < 0 || !values_.ReadOne(columns_, size_t(at), &v) || v.damaged) return std::nullopt;
+    return std::move(v.bytes);
+  }
+
+ private:
+  const RowValueReader& values_;
+  const engine::TableDef& table_;
+  const engine::RecordColumns& columns_;
+};
+
+constexpr uint16_t kBodyTypePlainText = 1;
+constexpr uint16_t kBodyTypeRtf = 2;
+
 }  // namespace
 
 std::string ModernFolderTableName(int version, uint64_t number) {
@@ -112,6 +164,44 @@ const engine::TableDef* ModernStore::FindTable(const std::string& name) const {
   return reader_.FindTable(name);
 }
 
+void ModernStore::DecodeBlob(const MailboxContext* m, DecodePurpose purpose, const RowValue& v,
+                             const SeparatedValues& separated, ItemRecords* records,
+                             const std::vector<std::string>* only) const {
+  if (!IsRealLayout(v.bytes)) {
+    decoder_.Decode(purpose, v.column ? v.column->name : "PropertyBlob", v.engine_type, v.code_page,
+                    ByteView(v.bytes), records);
+    return;
+  }
+  RealBlob blob = ParseRealBlob(v.bytes);
+  for (BlobEntry& e : blob.entries) {
+    if (e.state == BlobValueState::kFarValue && separated) {
+      if (std::optional<Bytes> far = separated(e.far_slot)) ResolveFarValue(*far, &e);
+    }
+    if (e.state != BlobValueState::kValue) continue;
+    // A named number means nothing without the mailbox's map: taken as it
+    // is, it could land in any field.
+    std::optional<uint16_t> id = e.id;
+    if (e.id >= kFirstNamedPropertyId) {
+      id = m && m->named.loaded() ? m->named.Resolve(e.id) : std::nullopt;
+    }
+    if (!id) continue;
+    const std::string name = EntryName(e, *id);
+    if (only && std::find(only->begin(), only->end(), name) == only->end()) continue;
+    if (name == "MN81a9") {
+      decoder_.Decode(purpose, name, engine::kColumnBinary, 0, MemberList(e.items), records);
+      continue;
+    }
+    const int stored =
+        decoder_.Decode(purpose, name, e.engine_type, e.code_page, ByteView(e.value), records);
+    // Contact texts known by meaning but by no rule (file-as, e-mail
+    // display names) are kept with the contact's other strings.
+    if (stored == 0 && purpose == DecodePurpose::kContactDetail && e.id >= kFirstNamedPropertyId &&
+        e.letters == "S" && !e.value.empty()) {
+      records->contact.strings[name] = std::string(e.value.begin(), e.value.end());
+    }
+  }
+}
+
 bool ModernStore::WalkMailboxes() {
   const engine::TableDef* table = FindTable(kMailboxTable);
   if (table) {
@@ -121,14 +211,24 @@ bool ModernStore::WalkMailboxes() {
     reader_.ForEachRecord(*table, [&](const engine::RecordRef&, engine::RecordColumns& columns) {
       FolderNode node;
       std::optional<uint64_t> number = ReadId(values, *table, columns, c.mailbox_number, 1);
-      const int name_slot = ColumnSlot(*table, c.mailbox_name);
-      RowValue name;
       if (!number) return true;
-      if (name_slot >= 0 && values.ReadOne(columns, size_t(name_slot), &name)) {
+      // The first of the mailbox's name, its owner's name and the name in
+      // its blob that has a value.
+      for (const char* column : {c.mailbox_name, "MailboxOwnerDisplayName", "PropertyBlob"}) {
+        const int name_slot = ColumnSlot(*table, column);
+        RowValue name;
+        if (name_slot < 0 || !values.ReadOne(columns, size_t(name_slot), &name)) continue;
         ItemRecords records;
-        decoder_.Decode(DecodePurpose::kFolderRow, c.folder_name, name.engine_type, name.code_page,
-                        ByteView(name.bytes), &records);
+        if (IsBlobColumn(column)) {
+          RowSeparatedValues separated(values, *table, columns);
+          DecodeBlob(nullptr, DecodePurpose::kFolderRow, name, separated, &records,
+                     &kMailboxBlobNames);
+        } else {
+          decoder_.Decode(DecodePurpose::kFolderRow, c.folder_name, name.engine_type,
+                          name.code_page, ByteView(name.bytes), &records);
+        }
         node.display_name = records.node.display_name;
+        if (!node.display_name.empty()) break;
       }
       node.folder_id = *number;
       node.parent_id = kRootFolderId;
@@ -169,15 +269,26 @@ void ModernStore::Load(MailboxContext& m) {
     m.attachment_table = "Attach-" + x;
   }
 
+  if (Modern2013(version_))
+    m.named = LoadNamedPropertyMap(reader_, NamedPropertyTableName(m.number));
+
   if (const engine::TableDef* table = FindTable(m.folder_table)) {
     const engine::LongValueReader lv = reader_.long_values();
     RowValueReader values(lv, *table);
     const std::vector<std::string> text_columns = {c.folder_name, c.container_class};
+    const int blob_slot = ColumnSlot(*table, "PropertyBlob");
     reader_.ForEachRecord(*table, [&](const engine::RecordRef&, engine::RecordColumns& columns) {
       std::optional<uint64_t> id = ReadId(values, *table, columns, c.folder_id);
       std::optional<uint64_t> parent = ReadId(values, *table, columns, c.parent_id);
       if (!id) return true;
       ItemRecords records;
+      // Name and class from the blob, where the columns leave them out.
+      RowValue blob;
+      if (blob_slot >= 0 && values.ReadOne(columns, size_t(blob_slot), &blob) &&
+          IsRealLayout(blob.bytes)) {
+        RowSeparatedValues separated(values, *table, columns);
+        DecodeBlob(&m, DecodePurpose::kFolderRow, blob, separated, &records, &kFolderBlobNames);
+      }
       for (const std::string& name : text_columns) {
         RowValue v;
         const int slot = ColumnSlot(*table, name);
@@ -261,18 +372,31 @@ std::vector<MessageSummary> ModernStore::ListFolder(MailboxContext& m, uint32_t 
     engine::RecordColumns columns;
     if (reader_.ReadRecordColumns(*ref, *messages, nullptr, &columns) != 0) continue;
     ItemRecords records;
+    std::vector<Recipient> recipients;
     for (const std::string& name : ListColumns()) {
       const int slot = ColumnSlot(*messages, name);
       RowValue v;
       if (slot < 0 || !values.ReadOne(columns, size_t(slot), &v)) continue;
-      if (name == "PropertyBlob") {
-        if (Modern2013(version_))
+      if (IsBlobColumn(name)) {
+        if (!Modern2013(version_)) continue;
+        if (IsRealLayout(v.bytes)) {
+          RowSeparatedValues separated(values, *messages, columns);
+          DecodeBlob(&m, DecodePurpose::kMessageListRow, v, separated, &records, &kListBlobNames);
+        } else if (name == "PropertyBlob") {
           ParseBlobForList(ByteView(v.bytes), blob_options, &records.summary);
+        }
+        continue;
+      }
+      if (name == "RecipientList") {
+        recipients = ParseRecipientList(v.bytes);
         continue;
       }
       decoder_.Decode(DecodePurpose::kMessageListRow, name, v.engine_type, v.code_page,
                       ByteView(v.bytes), &records);
     }
+    // Lines the row does not hold itself come from its recipients.
+    if (records.summary.to.empty()) records.summary.to = RecipientLine(recipients, kRecipientTo);
+    if (records.summary.cc.empty()) records.summary.cc = RecipientLine(recipients, kRecipientCc);
     records.summary.message_key = key;
     rows.push_back(std::move(records.summary));
   }
@@ -298,15 +422,85 @@ std::optional<ItemRecords> ModernStore::OpenMessage(MailboxContext& m, uint64_t 
                     ByteView(v.bytes), &records);
   }
   *purpose = PurposeForClass(records.summary.message_class);
+  auto separated = [&values](uint16_t slot) -> std::optional<Bytes> {
+    const std::string column = SeparatedPropertyColumn(slot);
+    for (const RowValue& v : values) {
+      if (v.column->name == column && !v.damaged) return v.bytes;
+    }
+    return std::nullopt;
+  };
   for (const RowValue& v : values) {
+    if (Modern2013(version_) && IsBlobColumn(v.column->name)) {
+      DecodeBlob(&m, *purpose, v, separated, &records);
+      continue;
+    }
+    if (v.column->name == "RecipientList") {
+      const std::vector<Recipient> recipients = ParseRecipientList(v.bytes);
+      if (records.summary.cc.empty()) records.summary.cc = RecipientLine(recipients, kRecipientCc);
+      continue;
+    }
     decoder_.Decode(*purpose, v.column->name, v.engine_type, v.code_page, ByteView(v.bytes),
                     &records);
   }
-  // "NativeBody" holds the plain text itself when the body type says so.
-  constexpr uint16_t kBodyTypePlainText = 1;
+  // "NativeBody" holds the plain text itself, or compressed RTF, when the
+  // body type says so.
   if (records.message.body_type == kBodyTypePlainText) records.message.body_is_text = true;
+  if (records.message.body_type == kBodyTypeRtf && !records.message.rtf_body &&
+      !records.message.body_is_text && !records.message.body.empty()) {
+    if (std::optional<RtfText> rtf = DecompressRtf(records.message.body)) {
+      records.message.rtf_compressed_length = records.message.body.size();
+      records.message.rtf_body = std::move(rtf->text);
+      records.message.body.clear();
+    }
+  }
   records.summary.message_key = key;
   return records;
+}
+
+bool ModernStore::ReadMessageColumns(MailboxContext& m, uint64_t key,
+                                     engine::RecordColumns* columns) {
+  const engine::TableDef* messages = FindTable(m.message_table);
+  if (!messages) return false;
+  std::optional<engine::RecordRef> ref = FindMessage(m, key);
+  return ref && reader_.ReadRecordColumns(*ref, *messages, nullptr, columns) == 0;
+}
+
+void ModernStore::IndexAttachments(MailboxContext& m) {
+  if (m.attachments_indexed) return;
+  m.attachments_indexed = true;
+  const engine::TableDef* attachments = FindTable(m.attachment_table);
+  if (!attachments) return;
+  // Attachment rows name their message by document id (2013+) or by its
+  // key (2010); rows of servers name none and are found by "Inid".
+  const char* owner_column = Modern2013(version_) ? "MessageDocumentId" : "N67b0";
+  const bool has_owner = ColumnSlot(*attachments, owner_column) >= 0;
+  const bool has_inid = Modern2013(version_) && ColumnSlot(*attachments, "Inid") >= 0;
+  const engine::LongValueReader lv = reader_.long_values();
+  RowValueReader values(lv, *attachments);
+  reader_.ForEachRecord(
+      *attachments, [&](const engine::RecordRef& ref, engine::RecordColumns& columns) {
+        const RecordLocation at{ref.page_number, ref.tag_index};
+        if (has_inid) {
+          if (std::optional<uint64_t> inid = ReadId(values, *attachments, columns, "Inid", 1)) {
+            m.attachments_by_inid.emplace(*inid, at);
+          }
+        }
+        if (!has_owner) return true;
+        std::optional<uint64_t> id;
+        if (Modern2013(version_)) {
+          id = ReadId(values, *attachments, columns, owner_column, 1);
+        } else {
+          const int slot = ColumnSlot(*attachments, owner_column);
+          RowValue v;
+          if (slot >= 0 && values.ReadOne(columns, size_t(slot), &v) && v.bytes.size() >= kIdSize) {
+            id = LoadU64LE(v.bytes.data());
+          }
+        }
+        if (id) m.attachment_index.push_back({*id, at});
+        return true;
+      });
+  std::stable_sort(m.attachment_index.begin(), m.attachment_index.end(),
+                   [](const auto& a, const auto& b) { return a.first < b.first; });
 }
 
 std::vector<AttachmentRecord> ModernStore::ListAttachments(MailboxContext& m, uint64_t key) {
@@ -314,61 +508,74 @@ std::vector<AttachmentRecord> ModernStore::ListAttachments(MailboxContext& m, ui
   const engine::TableDef* attachments = FindTable(m.attachment_table);
   const engine::TableDef* messages = FindTable(m.message_table);
   if (!attachments || !messages) return out;
-  // Attachment rows name their message by document id (2013+) or by its
-  // key (2010).
-  const char* owner_column = Modern2013(version_) ? "MessageDocumentId" : "N67b0";
+  IndexAttachments(m);
   const engine::LongValueReader lv = reader_.long_values();
-  uint64_t owner = key;
+  std::vector<RecordLocation> rows;
+  bool listed = false;
   if (Modern2013(version_)) {
-    std::optional<engine::RecordRef> ref = FindMessage(m, key);
-    if (!ref) return out;
     engine::RecordColumns columns;
-    if (reader_.ReadRecordColumns(*ref, *messages, nullptr, &columns) != 0) return out;
+    if (!ReadMessageColumns(m, key, &columns)) return out;
     RowValueReader values(lv, *messages);
-    std::optional<uint64_t> id = ReadId(values, *messages, columns, owner_column, 1);
-    if (!id) return out;
-    owner = *id;
-  }
-  if (!m.attachments_indexed) {
-    m.attachments_indexed = true;
-    RowValueReader values(lv, *attachments);
-    reader_.ForEachRecord(*attachments, [&](const engine::RecordRef& ref,
-                                            engine::RecordColumns& columns) {
-      std::optional<uint64_t> id;
-      if (Modern2013(version_)) {
-        id = ReadId(values, *attachments, columns, owner_column, 1);
-      } else {
-        const int slot = ColumnSlot(*attachments, owner_column);
-        RowValue v;
-        if (slot >= 0 && values.ReadOne(columns, size_t(slot), &v) && v.bytes.size() >= kIdSize) {
-          id = LoadU64LE(v.bytes.data());
-        }
+    // A message that lists its attachments says which rows are its own.
+    const int subobjects_slot = ColumnSlot(*messages, "SubobjectsBlob");
+    RowValue subobjects;
+    if (subobjects_slot >= 0 && values.ReadOne(columns, size_t(subobjects_slot), &subobjects) &&
+        !subobjects.bytes.empty()) {
+      listed = true;
+      for (int64_t inid : ParseSubobjectIds(subobjects.bytes)) {
+        auto it = m.attachments_by_inid.find(uint64_t(inid));
+        if (it != m.attachments_by_inid.end()) rows.push_back(it->second);
       }
-      if (id) m.attachment_index.push_back({*id, {ref.page_number, ref.tag_index}});
-      return true;
-    });
-    std::stable_sort(m.attachment_index.begin(), m.attachment_index.end(),
-                     [](const auto& a, const auto& b) { return a.first < b.first; });
+    } else if (std::optional<uint64_t> id =
+                   ReadId(values, *messages, columns, "MessageDocumentId", 1)) {
+      key = *id;
+    } else {
+      return out;
+    }
   }
-  auto range = std::equal_range(m.attachment_index.begin(), m.attachment_index.end(),
-                                std::make_pair(owner, RecordLocation{}),
-                                [](const auto& a, const auto& b) { return a.first < b.first; });
+  if (!listed) {
+    auto range = std::equal_range(m.attachment_index.begin(), m.attachment_index.end(),
+                                  std::make_pair(key, RecordLocation{}),
+                                  [](const auto& a, const auto& b) { return a.first < b.first; });
+    for (auto it = range.first; it != range.second; ++it) rows.push_back(it->second);
+  }
   RowValueReader values(lv, *attachments);
-  for (auto it = range.first; it != range.second; ++it) {
-    engine::RecordRef ref = reader_.MakeRecordRef(it->second.page_number, it->second.tag_index);
+  for (const RecordLocation& at : rows) {
+    engine::RecordRef ref = reader_.MakeRecordRef(at.page_number, at.tag_index);
     engine::RecordColumns columns;
     if (ref.kind != engine::kKindRecord ||
         reader_.ReadRecordColumns(ref, *attachments, nullptr, &columns) != 0) {
       continue;
     }
     ItemRecords records;
+    RowSeparatedValues separated(values, *attachments, columns);
     for (const RowValue& v : values.Read(columns)) {
+      if (IsBlobColumn(v.column->name)) {
+        if (IsRealLayout(v.bytes)) {
+          DecodeBlob(&m, DecodePurpose::kAttachmentRow, v, separated, &records);
+        }
+        continue;
+      }
       decoder_.Decode(DecodePurpose::kAttachmentRow, v.column->name, v.engine_type, v.code_page,
                       ByteView(v.bytes), &records);
     }
     out.push_back(std::move(records.attachment));
   }
   return out;
+}
+
+std::vector<Recipient> ModernStore::Recipients(FolderRef ref, uint64_t key) {
+  if (ref.mailbox < 0) return {};
+  MailboxContext* m = Mailbox(uint32_t(ref.mailbox));
+  const engine::TableDef* messages = m ? FindTable(m->message_table) : nullptr;
+  engine::RecordColumns columns;
+  if (!messages || !ReadMessageColumns(*m, key, &columns)) return {};
+  const engine::LongValueReader lv = reader_.long_values();
+  RowValueReader values(lv, *messages);
+  const int slot = ColumnSlot(*messages, "RecipientList");
+  RowValue v;
+  if (slot < 0 || !values.ReadOne(columns, size_t(slot), &v)) return {};
+  return ParseRecipientList(v.bytes);
 }
 
 bool ModernStore::WalkFolders() {

@@ -15,10 +15,20 @@
 // folder of that mailbox; a message's attachments are the attachment rows
 // that carry its "MessageDocumentId", in table order; folder ids are 8-byte
 // binaries read little-endian.
+//
+// Exchange 2013 and later servers write more than that: ids of 26 bytes
+// (keyed by their last 8 bytes, like "MessageId"; a parent of all zeros is
+// a top folder), property blobs with 3-byte entries whose values may lie in
+// the row's "SeparatedPropertyNN" columns, "OffPagePropertyBlob" beside
+// "PropertyBlob", recipients in "RecipientList", a message's attachment
+// "Inid"s in its "SubobjectsBlob", and named properties numbered per mailbox
+// ("ExtendedPropertyNameMapping_n", named_property_map.h). Both are read:
+// the blob layout is told by its header, the rest by what the rows hold.
 #ifndef TARNWELL_STORE_MODERN_STORE_H_
 #define TARNWELL_STORE_MODERN_STORE_H_
 
 #include <cstdint>
+#include <functional>
 #include <map>
 #include <memory>
 #include <optional>
@@ -31,7 +41,10 @@
 #include "store/key_ordinal_map.h"
 #include "store/location_file.h"
 #include "store/mail_store.h"
+#include "store/named_property_map.h"
 #include "store/property_decoder.h"
+#include "store/recipient_list.h"
+#include "store/row_values.h"
 
 namespace tarnwell::store {
 
@@ -56,6 +69,10 @@ struct MailboxContext {
   // stably by owner.
   std::vector<std::pair<uint64_t, RecordLocation>> attachment_index;
   bool attachments_indexed = false;
+  // Attachment rows by "Inid", for messages that list theirs in
+  // "SubobjectsBlob".
+  std::map<uint64_t, RecordLocation> attachments_by_inid;
+  NamedPropertyMap named;
 };
 
 class ModernStore : public MailStore {
@@ -96,7 +113,26 @@ class ModernStore : public MailStore {
                                          DecodePurpose* purpose);
   std::vector<AttachmentRecord> ListAttachments(MailboxContext& mailbox, uint64_t message_key);
 
+  // The recipients of a message, from its "RecipientList"; empty when the
+  // row has none.
+  std::vector<Recipient> Recipients(FolderRef ref, uint64_t message_key);
+
  private:
+  // Fetches a row's "SeparatedPropertyNN" value by slot.
+  using SeparatedValues = std::function<std::optional<Bytes>(uint16_t slot)>;
+
+  // Decodes a "PropertyBlob" / "OffPagePropertyBlob" value. Blobs of the
+  // layout servers write go entry by entry, named properties by meaning
+  // (through the mailbox's map; without one they are left out), far values
+  // from `separated`; with `only`, entries of other names are left out.
+  // Blobs of the other layout go to the decoder as the column they are.
+  void DecodeBlob(const MailboxContext* mailbox, DecodePurpose purpose, const RowValue& value,
+                  const SeparatedValues& separated, ItemRecords* records,
+                  const std::vector<std::string>* only = nullptr) const;
+  void IndexAttachments(MailboxContext& mailbox);
+  // The message row's columns; false when the key maps no readable row.
+  bool ReadMessageColumns(MailboxContext& mailbox, uint64_t key, engine::RecordColumns* columns);
+
   const engine::TableDef* FindTable(const std::string& name) const;
   void Load(MailboxContext& mailbox);
   std::optional<engine::RecordRef> FindMessage(MailboxContext& mailbox, uint64_t key);

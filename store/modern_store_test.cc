@@ -23,6 +23,7 @@ struct Case {
   bool later_variant;
   bool damaged;
   ScanMode mode;
+  bool real_layout = false;
 };
 
 const Case kCases[] = {
@@ -30,6 +31,8 @@ const Case kCases[] = {
     {"v2013_later_advance", 5, true, true, ScanMode::kAdvance},
     {"v2010_standard", 3, false, true, ScanMode::kStandard},
     {"v2010_advance", 3, false, false, ScanMode::kAdvance},
+    {"real_layout_standard", 5, true, true, ScanMode::kStandard, true},
+    {"real_layout_advance", 5, true, false, ScanMode::kAdvance, true},
 };
 
 class Tree : public FolderTreeSink {
@@ -72,6 +75,7 @@ class ModernStoreTest : public ::testing::TestWithParam<Case> {
     fx::ModernStoreOptions options;
     options.version = c.version;
     options.later_2013_variant = c.later_variant;
+    options.real_layout = c.real_layout;
     if (c.damaged) options.damage = fx::ModernDamageOptions::All();
     const std::string path = dir_ + "/store.edb";
     Status s = fx::BuildModernStore(options, path, &manifest_);

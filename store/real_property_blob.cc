@@ -398,7 +398,9 @@ bool IsRealLayout(ByteView blob) {
   return flags == kFlagsPlain || flags == kFlagsWithNearArea;
 }
 
-RealBlob ParseRealBlob(ByteView blob) {
+namespace {
+
+RealBlob Parse(ByteView blob, bool trailing_bytes_allowed) {
   RealBlob out;
   if (!IsRealLayout(blob)) {
     out.problem = "not a property blob of this layout";
@@ -481,17 +483,25 @@ RealBlob ParseRealBlob(ByteView blob) {
     }
     out.entries.push_back(std::move(e));
   }
-  if (values.pos() != values_end) {
+  const bool has_near_area = blob.U16LE(kFlagsOffset) == kFlagsWithNearArea;
+  out.used = has_near_area ? near_end : values.pos();
+  if (values.pos() != values_end && (has_near_area || !trailing_bytes_allowed)) {
     out.problem = "bytes left after the last value";
     return out;
   }
-  if (near_end != blob.size()) {
+  if (near_end != blob.size() && !trailing_bytes_allowed) {
     out.problem = "bytes left after the last near value";
     return out;
   }
   out.complete = true;
   return out;
 }
+
+}  // namespace
+
+RealBlob ParseRealBlob(ByteView blob) { return Parse(blob, false); }
+
+RealBlob ParseRealBlobPrefix(ByteView bytes) { return Parse(bytes, true); }
 
 std::vector<BlobEntry> ParseRealBlobEntries(ByteView blob) { return ParseRealBlob(blob).entries; }
 

@@ -62,11 +62,19 @@ struct RealBlob {
   std::vector<BlobEntry> entries;  // in entry order; those before any damage
   bool complete = false;           // every entry and value read, nothing left over
   std::string problem;             // why not complete
+  // Bytes from the blob's start to the end of its last value (inline or
+  // near); 0 when damage stopped the parse.
+  size_t used = 0;
 };
 
 // Reads a blob of this layout. A damaged blob gives the entries before the
 // damage; nothing is read outside the blob.
 RealBlob ParseRealBlob(ByteView blob);
+
+// Reads a blob that starts at the first byte of `bytes` and may be followed
+// by anything (blobs packed back to back in an undocumented frame): complete
+// when every entry and value was read; `used` says where the blob ends.
+RealBlob ParseRealBlobPrefix(ByteView bytes);
 
 std::vector<BlobEntry> ParseRealBlobEntries(ByteView blob);
 

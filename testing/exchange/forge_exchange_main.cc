@@ -1,9 +1,12 @@
 // tarnwell-forge-exchange: writes an Exchange store and its manifest.
 //
-//   tarnwell-forge-exchange OUT.edb [--version 4|1|2|3|5] [--later-2013] [--public] [--damage]
+//   tarnwell-forge-exchange OUT.edb [--version 4|1|2|3|5] [--later-2013] [--real-layout]
+//                           [--public] [--damage]
 //                           [--messages N] [--large-folder N] [--size-mib N]
 //                           [--seed N] [--manifest OUT.json]
 //
+// --real-layout writes version 5 as Exchange 2013-2019 servers lay it out
+// (file-format revision 110; see modern_store_builder.h).
 // --size-mib sets the average bytes per generated message so that N messages
 // come to about that size (e.g. --messages 200000 --size-mib 1024).
 #include <cstdio>
@@ -18,8 +21,8 @@
 namespace {
 
 constexpr const char kUsage[] =
-    "usage: tarnwell-forge-exchange OUT.edb [--version 4|1|2|3|5] [--later-2013] [--public]\n"
-    "                               [--damage]\n"
+    "usage: tarnwell-forge-exchange OUT.edb [--version 4|1|2|3|5] [--later-2013] [--real-layout]\n"
+    "                               [--public] [--damage]\n"
     "                               [--messages N] [--large-folder N] [--size-mib N]\n"
     "                               [--seed N] [--manifest OUT.json]\n";
 constexpr uint64_t kMiB = 1 << 20;
@@ -49,6 +52,7 @@ int main(int argc, char** argv) {
   std::string manifest_path;
   uint64_t size_mib = 0;
   bool later_2013 = false;
+  bool real_layout = false;
   for (int i = 2; i < argc; ++i) {
     const std::string arg = argv[i];
     if (arg == "--public") {
@@ -57,6 +61,11 @@ int main(int argc, char** argv) {
     }
     if (arg == "--later-2013") {
       later_2013 = true;
+      continue;
+    }
+    if (arg == "--real-layout") {
+      real_layout = true;
+      options.version = kExchange2013;
       continue;
     }
     if (arg == "--damage") {
@@ -112,6 +121,7 @@ int main(int argc, char** argv) {
     ModernStoreOptions modern;
     modern.version = options.version;
     modern.later_2013_variant = later_2013;
+    modern.real_layout = real_layout;
     if (options.damage.orphan_folder) modern.damage = ModernDamageOptions::All();
     modern.bulk = options.bulk;
     modern.record_items = options.record_items;

@@ -12,10 +12,13 @@
 #include <map>
 #include <memory>
 #include <optional>
+#include <string_view>
+#include <tuple>
 #include <vector>
 
 #include "base/text.h"
 #include "testing/exchange/property_blob_encoder.h"
+#include "testing/exchange/real_blob_encoder.h"
 #include "testing/exchange/rtf_literal_encoder.h"
 #include "testing/forge_database.h"
 #include "testing/forge_long_value.h"
@@ -30,6 +33,8 @@ constexpr uint32_t kFormatVersion = 0x620;
 constexpr uint32_t kPage32K = 32768;
 constexpr uint32_t kRevision2010 = 17;
 constexpr uint32_t kRevision2013 = 20;
+constexpr uint32_t kRevisionReal = 110;
+constexpr uint64_t kFirstWideLongValueId = (uint64_t(1) << 32) + 1;
 // A catalog of this revision has records ending at fixed column 11.
 constexpr uint32_t kEarly2013CatalogRevision = 17;
 
@@ -168,6 +173,82 @@ Schema Attachment2013Schema() {
   return s;
 }
 
+// ---- Schemas of the real layout
+
+constexpr int kSeparatedColumns = 4;
+
+Schema MailboxRealSchema() {
+  Schema s;
+  s.Add({"MailboxNumber", kColumnLong, 0, Slot::kFixed});
+  s.Add({"DisplayName", kColumnText, kCodePageUnicode, Slot::kVariable});
+  s.Add({"MailboxOwnerDisplayName", kColumnText, kCodePageUnicode, Slot::kTagged});
+  s.Add({"PropertyBlob", kColumnLongBinary, 0, Slot::kTagged});
+  s.Seal();
+  return s;
+}
+
+Schema FolderRealSchema() {
+  Schema s;
+  s.Add({"SpecialFolderNumber", kColumnLong, 0, Slot::kFixed});
+  s.Add({"FolderId", kColumnBinary, 0, Slot::kVariable});
+  s.Add({"ParentFolderId", kColumnBinary, 0, Slot::kVariable});
+  s.Add({"DisplayName", kColumnText, kCodePageUnicode, Slot::kVariable});
+  s.Add({"ContainerClass", kColumnText, kCodePageUnicode, Slot::kVariable});
+  s.Add({"PropertyBlob", kColumnLongBinary, 0, Slot::kTagged});
+  s.Add({"SeparatedProperty01", kColumnLongBinary, 0, Slot::kTagged});
+  s.Seal();
+  return s;
+}
+
+Schema MessageRealSchema() {
+  Schema s;
+  s.Add({"MessageDocumentId", kColumnLong, 0, Slot::kFixed});
+  s.Add({"IsRead", kColumnBit, 0, Slot::kFixed});
+  s.Add({"Importance", kColumnLong, 0, Slot::kFixed});
+  s.Add({"HasAttachments", kColumnBit, 0, Slot::kFixed});
+  s.Add({"BodyType", kColumnShort, 0, Slot::kFixed});
+  s.Add({"DateCreated", kColumnDateTime, 0, Slot::kFixed});
+  s.Add({"DateReceived", kColumnDateTime, 0, Slot::kFixed});
+  s.Add({"DateSent", kColumnDateTime, 0, Slot::kFixed});
+  s.Add({"MessageId", kColumnBinary, 0, Slot::kVariable});
+  s.Add({"FolderId", kColumnBinary, 0, Slot::kVariable});
+  s.Add({"MessageClass", kColumnText, kCodePageWestern, Slot::kTagged});
+  s.Add({"DisplayTo", kColumnText, kCodePageUnicode, Slot::kTagged});
+  s.Add({"SubjectPrefix", kColumnText, kCodePageUnicode, Slot::kTagged});
+  s.Add({"PropertyBlob", kColumnLongBinary, 0, Slot::kTagged});
+  s.Add({"OffPagePropertyBlob", kColumnLongBinary, 0, Slot::kTagged});
+  s.Add({"RecipientList", kColumnLongBinary, 0, Slot::kTagged});
+  s.Add({"SubobjectsBlob", kColumnLongBinary, 0, Slot::kTagged});
+  s.Add({"NativeBody", kColumnLongBinary, 0, Slot::kTagged});
+  static const char* const kSeparated[kSeparatedColumns] = {
+      "SeparatedProperty01", "SeparatedProperty02", "SeparatedProperty03", "SeparatedProperty04"};
+  for (const char* name : kSeparated) s.Add({name, kColumnLongBinary, 0, Slot::kTagged});
+  s.Seal();
+  return s;
+}
+
+Schema AttachmentRealSchema() {
+  Schema s;
+  s.Add({"Inid", kColumnLongLong, 0, Slot::kFixed});
+  s.Add({"Size", kColumnLong, 0, Slot::kFixed});
+  s.Add({"Name", kColumnText, kCodePageUnicode, Slot::kTagged});
+  s.Add({"ContentType", kColumnText, kCodePageUnicode, Slot::kTagged});
+  s.Add({"Content", kColumnLongBinary, 0, Slot::kTagged});
+  s.Add({"PropertyBlob", kColumnLongBinary, 0, Slot::kTagged});
+  s.Seal();
+  return s;
+}
+
+Schema NameMappingSchema() {
+  Schema s;
+  s.Add({"PropNumber", kColumnLong, 0, Slot::kFixed});
+  s.Add({"PropDispId", kColumnLong, 0, Slot::kFixed});
+  s.Add({"PropGuid", kColumnBinary, 0, Slot::kVariable});
+  s.Add({"PropName", kColumnText, kCodePageUnicode, Slot::kVariable});
+  s.Seal();
+  return s;
+}
+
 // The list columns of code 3, shared by "Body-x" and "MsgHeader-X". Times
 // are 64-bit little-endian integers of two types.
 void AddListColumns2010(Schema* s) {
@@ -283,6 +364,189 @@ Bytes EncodeMembers(const std::vector<ListMember>& members) {
   return out;
 }
 
+// ---- Real layout: ids, named properties, recipients
+
+constexpr size_t kRealIdSize = 26;
+constexpr size_t kGuidBytes = 16;
+constexpr size_t kCounterBytes = 6;
+constexpr uint64_t kCounterMask = (uint64_t(1) << 48) - 1;
+
+// A mailbox's GUID: any 16 bytes of its own.
+Bytes MailboxGuid(size_t mailbox) {
+  Bytes g(kGuidBytes);
+  for (size_t i = 0; i < kGuidBytes; ++i) g[i] = uint8_t(0x5A ^ (mailbox * 37 + i * 11));
+  return g;
+}
+
+// GUID, 6-byte big-endian counter, 4 zero bytes.
+Bytes RealId(size_t mailbox, uint64_t counter) {
+  Bytes id = MailboxGuid(mailbox);
+  for (size_t i = kCounterBytes; i-- > 0;)
+    id.push_back(uint8_t((counter & kCounterMask) >> (8 * i)));
+  id.resize(kRealIdSize, 0);
+  return id;
+}
+
+// What readers key an id by: its last 8 bytes, little-endian.
+uint64_t RealIdKey(const Bytes& id) { return LoadU64LE(id.data() + id.size() - kIdSize); }
+
+// The counter in an item key ("00 01" + 6-byte big-endian counter).
+uint64_t KeyCounter(const Bytes& key) {
+  uint64_t c = 0;
+  for (size_t i = key.size() >= kCounterBytes ? key.size() - kCounterBytes : 0; i < key.size();
+       ++i) {
+    c = (c << 8) | key[i];
+  }
+  return c;
+}
+
+// Property sets, as a GUID is stored.
+const Bytes kSetAppointment = {0x02, 0x20, 0x06, 0x00, 0x00, 0x00, 0x00, 0x00,
+                               0xC0, 0x00, 0x00, 0x00, 0x00, 0x00, 0x00, 0x46};
+const Bytes kSetTask = {0x03, 0x20, 0x06, 0x00, 0x00, 0x00, 0x00, 0x00,
+                        0xC0, 0x00, 0x00, 0x00, 0x00, 0x00, 0x00, 0x46};
+const Bytes kSetAddress = {0x04, 0x20, 0x06, 0x00, 0x00, 0x00, 0x00, 0x00,
+                           0xC0, 0x00, 0x00, 0x00, 0x00, 0x00, 0x00, 0x46};
+const Bytes kSetPublicStrings = {0x29, 0x03, 0x02, 0x00, 0x00, 0x00, 0x00, 0x00,
+                                 0xC0, 0x00, 0x00, 0x00, 0x00, 0x00, 0x00, 0x46};
+
+struct NamedProperty {
+  const Bytes* set;
+  uint32_t dispid;   // when named by id
+  const char* name;  // when named by string ("" otherwise)
+  bool operator<(const NamedProperty& o) const {
+    auto key = [](const NamedProperty& p) {
+      return std::make_tuple(*p.set, p.dispid, std::string_view(p.name));
+    };
+    return key(*this) < key(o);
+  }
+};
+
+// The published property behind each fixed number the fixture content uses.
+std::optional<NamedProperty> PublishedProperty(uint16_t fixed) {
+  switch (fixed) {
+    case 0x814E:
+      return NamedProperty{&kSetAppointment, 0x820D, ""};  // start
+    case 0x8198:
+      return NamedProperty{&kSetAppointment, 0x820E, ""};  // end
+    case 0x810C:
+      return NamedProperty{&kSetAppointment, 0x8208, ""};  // location
+    case 0x805C:
+      return NamedProperty{&kSetAppointment, 0x8205, ""};  // busy status
+    case 0x8078:
+      return NamedProperty{&kSetTask, 0x8104, ""};  // start
+    case 0x8079:
+      return NamedProperty{&kSetTask, 0x8105, ""};  // due
+    case 0x8138:
+      return NamedProperty{&kSetTask, 0x8101, ""};  // status
+    case 0x8121:
+      return NamedProperty{&kSetTask, 0x8102, ""};  // percent complete
+    case 0x8124:
+      return NamedProperty{&kSetTask, 0x811C, ""};  // complete
+    case 0x814A:
+      return NamedProperty{&kSetTask, 0x811F, ""};  // owner
+    case 0x81A9:
+      return NamedProperty{&kSetAddress, 0x8054, ""};  // list members
+    case 0x8002:
+      return NamedProperty{&kSetPublicStrings, 0, "Keywords"};
+    default:
+      return std::nullopt;
+  }
+}
+
+// A named property no reader knows, at a number that means an appointment's
+// end in the other layout.
+const NamedProperty kUnknownNamed = {&kSetPublicStrings, 0, "TarnwellUnknownTime"};
+constexpr uint16_t kUnknownNamedNumber = 0x8198;
+constexpr uint64_t kUnknownNamedTime = 0x01BF52FC7D1D8000ull;  // some day in 1999
+constexpr uint16_t kFirstNamedNumbers[] = {0x8078, 0x8100, 0x8000};
+
+// The numbers one mailbox gives its named properties, in first-use order.
+class NamedNumbers {
+ public:
+  explicit NamedNumbers(size_t mailbox)
+      : next_(kFirstNamedNumbers[mailbox % std::size(kFirstNamedNumbers)]) {
+    numbers_[kUnknownNamed] = kUnknownNamedNumber;
+  }
+  uint16_t Number(const NamedProperty& p) {
+    auto it = numbers_.find(p);
+    if (it != numbers_.end()) return it->second;
+    if (next_ == kUnknownNamedNumber) ++next_;
+    return numbers_[p] = next_++;
+  }
+  const std::map<NamedProperty, uint16_t>& numbers() const { return numbers_; }
+
+ private:
+  uint16_t next_;
+  std::map<NamedProperty, uint16_t> numbers_;
+};
+
+// A one-off entry id: flags, provider, version, flags (Unicode), then the
+// name, address type and address as UTF-16LE strings with terminators.
+Bytes OneOffEntryId(const ListMember& m) {
+  constexpr uint8_t kOneOffUid[16] = {0x81, 0x2B, 0x1F, 0xA4, 0xBE, 0xA3, 0x10, 0x19,
+                                      0x9D, 0x6E, 0x00, 0xDD, 0x01, 0x0F, 0x54, 0x02};
+  constexpr uint16_t kUnicode = 0x8000;
+  Bytes out(4 + sizeof kOneOffUid + 4, 0);
+  std::memcpy(out.data() + 4, kOneOffUid, sizeof kOneOffUid);
+  StoreU16LE(out.data() + 4 + sizeof kOneOffUid + 2, kUnicode);
+  AppendUtf16z(&out, m.name);
+  AppendUtf16z(&out, m.address_type);
+  AppendUtf16z(&out, m.address);
+  return out;
+}
+
+// Recipient blobs framed as this builder frames them: u32 count, then per
+// recipient u32 length and the blob.
+constexpr uint16_t kPropRecipientType = 0x0C15;
+constexpr uint16_t kPropDisplayName = 0x3001;
+constexpr uint16_t kPropAddressType = 0x3002;
+constexpr uint16_t kPropAddress = 0x3003;
+constexpr uint16_t kPropSmtpAddress = 0x39FE;
+constexpr int32_t kRecipientTo = 1;
+constexpr int32_t kRecipientCc = 2;
+
+std::vector<std::string> SplitLine(const std::string& line) {
+  std::vector<std::string> parts;
+  const std::string separator = "; ";
+  size_t start = 0;
+  for (size_t at; (at = line.find(separator, start)) != std::string::npos;
+       start = at + separator.size()) {
+    parts.push_back(line.substr(start, at - start));
+  }
+  if (start < line.size()) parts.push_back(line.substr(start));
+  return parts;
+}
+
+Bytes RecipientList(const std::string& to, const std::string& cc) {
+  Bytes out(4, 0);
+  uint32_t count = 0;
+  for (const auto& [type, line] : {std::pair{kRecipientTo, to}, std::pair{kRecipientCc, cc}}) {
+    for (const std::string& name : SplitLine(line)) {
+      std::string local;
+      for (char c : name) {
+        if (std::isalnum(static_cast<unsigned char>(c))) local += char(std::tolower(c));
+      }
+      const std::string address =
+          (local.empty() ? "recipient" : local) + std::to_string(count) + "@example.org";
+      RealBlobEncoder r;
+      r.AddInt32(kPropRecipientType, type);
+      r.AddString(kPropDisplayName, name);
+      r.AddString(kPropAddressType, "SMTP");
+      r.AddString(kPropAddress, address);
+      r.AddString(kPropSmtpAddress, address);
+      const Bytes blob = r.Finish(nullptr);
+      const size_t at = out.size();
+      out.resize(at + 4);
+      StoreU32LE(out.data() + at, uint32_t(blob.size()));
+      out.insert(out.end(), blob.begin(), blob.end());
+      ++count;
+    }
+  }
+  StoreU32LE(out.data(), count);
+  return out;
+}
+
 // ---- Output
 
 class FilePageSink : public PageSink {
@@ -325,20 +589,24 @@ class FilePageSink : public PageSink {
 // One table being streamed: its record tree and its long-value tree.
 class StreamTable {
  public:
-  StreamTable(DatabaseWriter* db, std::string name, Schema schema, uint32_t max_rows_per_leaf)
-      : db_(db), name_(std::move(name)), schema_(std::move(schema)) {
+  StreamTable(DatabaseWriter* db, std::string name, Schema schema, uint32_t max_rows_per_leaf,
+              uint32_t long_value_id_size = kLongValueIdSize)
+      : db_(db), name_(std::move(name)), schema_(std::move(schema)), id_size_(long_value_id_size) {
     options_ = db->NewTree(0);
     options_.max_entries_per_leaf = max_rows_per_leaf;
     writer_ = std::make_unique<TreeWriter>(db->format(), options_, db->allocator(), db->sink());
     lv_options_ = db->NewTree(kPageFlagLongValue);
     lv_writer_ =
         std::make_unique<TreeWriter>(db->format(), lv_options_, db->allocator(), db->sink());
-    chunk_size_ = DefaultLongValueChunkSize(db->format(), kLongValueIdSize);
+    // Ids past 32 bits, so that only a reader of 8-byte ids finds the values.
+    if (id_size_ == kLongValueId64Size) next_lv_ = kFirstWideLongValueId;
+    chunk_size_ = DefaultLongValueChunkSize(db->format(), id_size_);
   }
 
   const Schema& schema() const { return schema_; }
   const std::string& name() const { return name_; }
   uint64_t rows() const { return rows_; }
+  uint32_t long_value_id_size() const { return id_size_; }
 
   Status AddRow(Bytes key, const std::vector<Cell>& cells) {
     TreeEntry e;
@@ -356,8 +624,7 @@ class StreamTable {
     v.data = std::move(data);
     v.compression = compression;
     std::vector<TreeEntry> entries;
-    Status s =
-        AppendLongValueEntries(v, kLongValueIdSize, chunk_size_, std::nullopt, &entries, nullptr);
+    Status s = AppendLongValueEntries(v, id_size_, chunk_size_, std::nullopt, &entries, nullptr);
     for (TreeEntry& e : entries) {
       if (!s.ok()) break;
       s = lv_writer_->Add(std::move(e));
@@ -379,6 +646,7 @@ class StreamTable {
   DatabaseWriter* db_;
   std::string name_;
   Schema schema_;
+  uint32_t id_size_;
   TreeOptions options_, lv_options_;
   std::unique_ptr<TreeWriter> writer_, lv_writer_;
   uint32_t chunk_size_ = 0;
@@ -457,7 +725,7 @@ class Row {
     }
     uint64_t id = 0;
     Status s = table_->AddLongValue(std::move(value), compression, &id);
-    if (s.ok()) cells_.push_back(SeparatedCell(c->id, id));
+    if (s.ok()) cells_.push_back(SeparatedCell(c->id, id, table_->long_value_id_size()));
     return s;
   }
   std::vector<Cell>& cells() { return cells_; }
@@ -519,15 +787,32 @@ std::string LargeHtml() {
 
 // ---- The store
 
+// What the real layout keeps: what the other layout keeps, and the values
+// its blobs can hold besides (16-bit values, doubles, members, long texts).
+void FitItemToReal(ManifestItem* item) {
+  const ManifestItem whole = *item;
+  FitItemTo2013(item);
+  item->doubles = whole.doubles;
+  item->numbers = whole.numbers;
+  item->members = whole.members;
+  item->strings = whole.strings;
+  item->headers = whole.headers;
+  item->body_text = whole.body_text;
+}
+
 struct MailboxTables {
   std::unique_ptr<StreamTable> folders, messages, headers, attachments;
   int32_t next_document_id = 1;
+  std::unique_ptr<NamedNumbers> named;  // real layout
 };
 
 class ModernWriter {
  public:
   ModernWriter(const ModernStoreOptions& options, StoreManifest* manifest)
-      : options_(options), manifest_(manifest), modern_(options.version == kExchange2013) {}
+      : options_(options),
+        manifest_(manifest),
+        modern_(options.version == kExchange2013),
+        real_(modern_ && options.real_layout) {}
 
   Status Write(const std::string& path);
 
@@ -539,11 +824,17 @@ class ModernWriter {
   Status WriteItem(size_t folder, ManifestItem item, bool short_id = false);
   Status WriteItem2013(size_t folder, ManifestItem* item, bool short_id);
   Status WriteItem2010(size_t folder, ManifestItem* item);
+  Status WriteItemReal(size_t folder, ManifestItem* item, bool short_id);
+  Status WriteNameMappings(DatabaseWriter* db);
   Bytes MessageId(size_t mailbox, const Bytes& key) const;
+  // The 26-byte id of folder `id` (a fixture id or a mailbox number), all
+  // zeros for a mailbox's top folder's parent.
+  Bytes RealFolderId(uint64_t id) const;
 
   const ModernStoreOptions& options_;
   StoreManifest* manifest_;
   const bool modern_;
+  const bool real_;
   StoreContent content_;
   std::vector<size_t> owner_;  // mailbox index of each folder
   std::vector<MailboxTables> tables_;
@@ -653,6 +944,13 @@ Bytes ModernWriter::MessageId(size_t mailbox, const Bytes& key) const {
   return id;
 }
 
+Bytes ModernWriter::RealFolderId(uint64_t id) const {
+  for (size_t i = 0; i < content_.folders.size(); ++i) {
+    if (content_.folders[i].id == id) return RealId(owner_[i], id);
+  }
+  return Bytes(kRealIdSize, 0);
+}
+
 Status ModernWriter::WriteMailboxes(StreamTable* table) {
   std::vector<size_t> order(content_.mailboxes.size());
   for (size_t i = 0; i < order.size(); ++i) order[i] = i;
@@ -669,6 +967,11 @@ Status ModernWriter::WriteMailboxes(StreamTable* table) {
       s = row.Number("MailboxNumber", mb.number);
       if (s.ok()) s = row.Text("DisplayName", mb.name);
       if (s.ok()) s = row.Text("MailboxOwnerDisplayName", mb.name);
+      if (s.ok() && real_) {
+        RealBlobEncoder blob;
+        blob.AddString(kPropDisplayName, mb.name);
+        s = row.Large("PropertyBlob", blob.Finish(nullptr), Compression::kNone);
+      }
     } else {
       s = row.Put("Q6764", Le64(mb.number));
       if (s.ok()) s = row.Text("S3001", mb.name);
@@ -686,13 +989,27 @@ Status ModernWriter::WriteFolders(size_t mailbox) {
   for (size_t i = 0; i < content_.folders.size(); ++i) {
     if (owner_[i] == mailbox) order.push_back(i);
   }
-  auto key = [&](size_t i) { return BinaryKey(Le64(content_.folders[i].id)); };
+  auto key = [&](size_t i) {
+    return BinaryKey(real_ ? RealFolderId(content_.folders[i].id) : Le64(content_.folders[i].id));
+  };
   std::sort(order.begin(), order.end(), [&](size_t a, size_t b) { return key(a) < key(b); });
   for (size_t r = 0; r < order.size(); ++r) {
     const ManifestFolder& f = content_.folders[order[r]];
     Row row(table, limit_, budget_);
-    Status s = row.Put(modern_ ? "FolderId" : "Q6748", Le64(f.id));
-    if (s.ok()) s = row.Put(modern_ ? "ParentFolderId" : "Q6749", Le64(f.parent));
+    Status s;
+    if (real_) {
+      constexpr uint16_t kPropContainerClass = 0x3613;
+      s = row.Put("FolderId", RealFolderId(f.id));
+      if (s.ok()) s = row.Put("ParentFolderId", RealFolderId(f.parent));
+      if (s.ok()) s = row.Number("SpecialFolderNumber", r + 1);
+      RealBlobEncoder blob;
+      blob.AddString(kPropDisplayName, f.name);
+      blob.AddString(kPropContainerClass, f.container_class);
+      if (s.ok()) s = row.Large("PropertyBlob", blob.Finish(nullptr), Compression::kNone);
+    } else {
+      s = row.Put(modern_ ? "FolderId" : "Q6748", Le64(f.id));
+      if (s.ok()) s = row.Put(modern_ ? "ParentFolderId" : "Q6749", Le64(f.parent));
+    }
     if (s.ok()) s = row.Text(modern_ ? "DisplayName" : "S3001", f.name);
     if (s.ok()) s = row.Text(modern_ ? "ContainerClass" : "S3613", f.container_class);
     if (s.ok()) s = table->AddRow(key(order[r]), row.cells());
@@ -706,7 +1023,9 @@ Status ModernWriter::WriteItem(size_t folder, ManifestItem item, bool short_id) 
   item.subject = item.subject_prefix + item.normalized_subject;
   item.to_shown = item.to;
   item.sender_shown = item.sender;
-  Status s = modern_ ? WriteItem2013(folder, &item, short_id) : WriteItem2010(folder, &item);
+  Status s = real_     ? WriteItemReal(folder, &item, short_id)
+             : modern_ ? WriteItem2013(folder, &item, short_id)
+                       : WriteItem2010(folder, &item);
   if (!s.ok()) return s;
   ++manifest_->msg_rows;
   if (short_id) {
@@ -806,6 +1125,189 @@ Status ModernWriter::WriteItem2013(size_t folder, ManifestItem* item, bool short
   return Status::Ok();
 }
 
+Status ModernWriter::WriteItemReal(size_t folder, ManifestItem* item, bool short_id) {
+  constexpr uint16_t kPropHeaders = 0x007D;
+  constexpr uint16_t kPropModified = 0x3008;
+  constexpr uint16_t kPropAttachFileName = 0x3704;
+  constexpr uint16_t kPropAttachLongFileName = 0x3707;
+  constexpr uint16_t kPropAttachMethod = 0x3705;
+  constexpr uint16_t kPropAttachSize = 0x0E20;
+  FitItemToReal(item);
+  const size_t mailbox = owner_[folder];
+  MailboxTables& t = tables_[mailbox];
+  NamedNumbers& named = *t.named;
+  item->document_id = t.next_document_id++;
+
+  std::vector<SeparatedValue> separated;
+  RealBlobEncoder blob;
+  if (!item->sender.empty()) blob.AddString(kPropSender, item->sender);
+  blob.AddString(kPropNormalizedSubject, item->normalized_subject);
+  blob.AddInt32(kPropFlags, int32_t(item->flags));
+  blob.AddTime(kPropModified, item->modified);
+  // A body too long for any count is left to the native body.
+  if (!item->body_text.empty() && !blob.AddString(kPropBody, item->body_text)) {
+    if (item->body_type != kBodyTypePlain) item->body_text.clear();
+  }
+  if (!item->headers.empty() && !blob.AddString(kPropHeaders, item->headers)) {
+    item->headers.clear();
+  }
+  const Bytes main_blob = blob.Finish(&separated);
+
+  // The item's own values; named ones under this mailbox's numbers.
+  RealBlobEncoder own(blob.next_slot());
+  auto id_of = [&](const std::string& name, uint16_t* id) -> Status {
+    std::string letters;
+    if (!SplitPropertyName(name, &letters, id)) return Status::InvalidArgument("bad name " + name);
+    if (*id < 0x8000) return Status::Ok();
+    std::optional<NamedProperty> p = PublishedProperty(*id);
+    if (!p) return Status::InvalidArgument("no published property for " + name);
+    *id = named.Number(*p);
+    return Status::Ok();
+  };
+  Status s;
+  uint16_t id = 0;
+  for (const auto& [name, value] : item->strings) {
+    if (!(s = id_of(name, &id)).ok()) return s;
+    if (name.rfind("MS", 0) == 0) {
+      std::vector<std::string> parts;
+      size_t start = 0;
+      for (size_t at; (at = value.find(';', start)) != std::string::npos; start = at + 1) {
+        parts.push_back(value.substr(start, at - start));
+      }
+      parts.push_back(value.substr(start));
+      if (!own.AddMultiString(id, parts)) return Status::InvalidArgument("blob " + name);
+    } else if (!own.AddString(id, value)) {
+      return Status::InvalidArgument("blob " + name);
+    }
+  }
+  for (const auto& [name, value] : item->times) {
+    if (!(s = id_of(name, &id)).ok()) return s;
+    own.AddTime(id, value);
+  }
+  for (const auto& [name, value] : item->numbers) {
+    if (!(s = id_of(name, &id)).ok()) return s;
+    switch (name[0]) {
+      case 'B':
+        own.AddBool(id, value != 0);
+        break;
+      case 'I':
+        own.AddInt16(id, int16_t(value));
+        break;
+      default:
+        own.AddInt32(id, int32_t(value));
+        break;
+    }
+  }
+  for (const auto& [name, value] : item->doubles) {
+    if (!(s = id_of(name, &id)).ok()) return s;
+    own.AddDouble(id, value);
+  }
+  if (!item->members.empty()) {
+    std::vector<Bytes> ids;
+    for (const ListMember& m : item->members) ids.push_back(OneOffEntryId(m));
+    if (!(s = id_of("MN81a9", &id)).ok()) return s;
+    if (!own.AddMultiBinary(id, ids)) return Status::InvalidArgument("blob members");
+  }
+  if (item->times.count("T814e")) own.AddTime(named.Number(kUnknownNamed), kUnknownNamedTime);
+  const Bytes own_blob = own.entries() ? own.Finish(&separated) : Bytes();
+
+  std::vector<int64_t> inids;
+  for (ManifestAttachment& a : item->attachments) {
+    inids.push_back(int64_t(++attachment_counter_));
+    a.key = Le64(uint64_t(inids.back()));
+  }
+  const Bytes message_id = RealId(mailbox, KeyCounter(item->key));
+  if (!short_id) item->key.assign(message_id.end() - kIdSize, message_id.end());
+
+  Row row(t.messages.get(), limit_, budget_);
+  s = row.Number("MessageDocumentId", uint32_t(item->document_id));
+  auto next = [&](Status st) {
+    if (s.ok()) s = st;
+  };
+  next(row.Put("MessageId", short_id ? item->key : message_id));
+  next(row.Put("FolderId", RealFolderId(content_.folders[folder].id)));
+  next(row.Text("MessageClass", item->message_class, true));
+  if (!item->to.empty()) next(row.Text("DisplayTo", item->to, true));
+  if (!item->subject_prefix.empty()) next(row.Text("SubjectPrefix", item->subject_prefix, true));
+  next(row.Number("DateCreated", item->created));
+  next(row.Number("DateReceived", item->received));
+  next(row.Number("DateSent", item->received));
+  next(row.Number("IsRead", (item->flags & kFlagRead) ? kBitTrue : 0));
+  next(row.Number("Importance", item->importance));
+  next(row.Number("HasAttachments", item->has_attachments ? kBitTrue : 0));
+  if (item->body_type) next(row.Number("BodyType", item->body_type));
+  next(row.Large("PropertyBlob", main_blob, Compression::kNone));
+  if (!own_blob.empty()) next(row.Large("OffPagePropertyBlob", own_blob, Compression::kNone));
+  if (!item->to.empty() || !item->cc.empty()) {
+    next(row.Large("RecipientList", RecipientList(item->to, item->cc), Compression::kNone));
+  }
+  if (!inids.empty())
+    next(row.Large("SubobjectsBlob", EncodeCompactIntegers(inids), Compression::kNone));
+  if (item->body_type) {
+    const std::string& body = item->body_type == kBodyTypeHtml ? item->body_html : item->body_text;
+    next(row.Large("NativeBody", Bytes(body.begin(), body.end()), Compression::kXpress,
+                   &item->body_long_value));
+  }
+  for (const SeparatedValue& v : separated) {
+    if (v.slot > kSeparatedColumns) return Status::InvalidArgument("too many far values");
+    char column[32];
+    std::snprintf(column, sizeof column, "SeparatedProperty%02u", unsigned(v.slot));
+    next(row.Large(column, v.encoded, Compression::kXpress));
+  }
+  if (s.ok()) s = t.messages->AddRow(IntegerKey(uint32_t(item->document_id), 4), row.cells());
+  if (!s.ok()) return s;
+
+  for (size_t k = 0; k < item->attachments.size(); ++k) {
+    ManifestAttachment& a = item->attachments[k];
+    const uint64_t inid = uint64_t(inids[k]);
+    a.name = !a.display_name.empty() ? a.display_name : a.file_name;
+    a.size = a.data.size();
+    if (manifest_->items_recorded) a.sha256 = Sha256Hex(ByteView(a.data));
+    RealBlobEncoder ablob;
+    if (!a.file_name.empty()) ablob.AddString(kPropAttachFileName, a.file_name);
+    if (!a.long_file_name.empty()) ablob.AddString(kPropAttachLongFileName, a.long_file_name);
+    ablob.AddInt32(kPropAttachMethod, int32_t(a.method));
+    ablob.AddInt32(kPropAttachSize, int32_t(a.size));
+    Row arow(t.attachments.get(), limit_, budget_);
+    s = arow.Number("Inid", inid);
+    next(arow.Number("Size", a.size));
+    next(arow.Text("Name", a.name));
+    next(arow.Text("ContentType", "application/octet-stream"));
+    next(arow.Large("Content", a.data, Compression::kNone, &a.long_value));
+    next(arow.Large("PropertyBlob", ablob.Finish(nullptr), Compression::kNone));
+    if (s.ok()) s = t.attachments->AddRow(IntegerKey(inid, 8), arow.cells());
+    if (!s.ok()) return s;
+    ++manifest_->attachment_rows;
+    if (!manifest_->items_recorded) a.data.clear();
+  }
+  return Status::Ok();
+}
+
+Status ModernWriter::WriteNameMappings(DatabaseWriter* db) {
+  for (size_t i = 0; i < tables_.size(); ++i) {
+    if (!tables_[i].named) continue;
+    const std::string name =
+        "ExtendedPropertyNameMapping_" + std::to_string(manifest_->mailboxes[i].number);
+    StreamTable table(db, name, NameMappingSchema(), 0, kLongValueId64Size);
+    std::vector<std::pair<uint16_t, NamedProperty>> rows;
+    for (const auto& [p, number] : tables_[i].named->numbers()) rows.push_back({number, p});
+    std::sort(rows.begin(), rows.end(),
+              [](const auto& a, const auto& b) { return a.first < b.first; });
+    for (const auto& [number, p] : rows) {
+      Row row(&table, limit_, budget_);
+      Status s = row.Number("PropNumber", number);
+      if (s.ok()) s = row.Number("PropDispId", p.dispid);
+      if (s.ok()) s = row.Put("PropGuid", *p.set);
+      if (s.ok() && *p.name) s = row.Text("PropName", p.name);
+      if (s.ok()) s = table.AddRow(IntegerKey(number, 4), row.cells());
+      if (!s.ok()) return s;
+    }
+    Status s = table.Finish();
+    if (!s.ok()) return s;
+  }
+  return Status::Ok();
+}
+
 Status ModernWriter::WriteItem2010(size_t folder, ManifestItem* item) {
   item->cc.clear();
   const size_t mailbox = owner_[folder];
@@ -900,11 +1402,16 @@ Status ModernWriter::Write(const std::string& path) {
   if (options_.version != kExchange2010 && options_.version != kExchange2013) {
     return Status::InvalidArgument("modern store version must be 3 or 5");
   }
+  if (options_.real_layout && !modern_) {
+    return Status::InvalidArgument("the real layout is one of version 5");
+  }
   DatabaseLayout layout;
   layout.format_version = kFormatVersion;
   layout.page_size = kPage32K;
-  layout.format_revision = modern_ ? kRevision2013 : kRevision2010;
-  if (modern_ && !options_.later_2013_variant) layout.catalog_revision = kEarly2013CatalogRevision;
+  layout.format_revision = real_ ? kRevisionReal : modern_ ? kRevision2013 : kRevision2010;
+  if (modern_ && !real_ && !options_.later_2013_variant) {
+    layout.catalog_revision = kEarly2013CatalogRevision;
+  }
   limit_ = options_.long_value_limit ? options_.long_value_limit
                                      : layout.page_size / kDefaultLimitDivisor;
   budget_ = layout.page_size / kRecordBudgetDivisor;
@@ -915,15 +1422,24 @@ Status ModernWriter::Write(const std::string& path) {
   m.version = options_.version;
   m.page_size = layout.page_size;
   m.revision = layout.format_revision;
-  m.later_2013_variant = modern_ && options_.later_2013_variant;
+  m.later_2013_variant = modern_ && (options_.later_2013_variant || real_);
+  m.real_layout = real_;
   m.attachment_key_column = modern_ ? "Inid" : "Q674a";
   m.items_recorded = options_.record_items;
   m.mailboxes = content_.mailboxes;
   m.folders = content_.folders;
   for (ManifestFolder& f : m.folders) f.items.clear();
   DescribeFolders();
+  if (real_) {
+    // Readers know folders by the last 8 bytes of their 26-byte ids.
+    for (ManifestFolder& f : m.folders) {
+      f.id = RealIdKey(RealFolderId(f.id));
+      f.parent = RealIdKey(RealFolderId(f.parent));
+    }
+  }
   if (modern_) {
-    for (const char* c : {"DateCreated", "LastModificationTime", "DateReceived"}) {
+    for (const char* c :
+         {"DateCreated", real_ ? "DateSent" : "LastModificationTime", "DateReceived"}) {
       m.time_encodings[std::string("Message.") + c] = "date_time_filetime";
     }
   } else {
@@ -958,18 +1474,28 @@ Status ModernWriter::Write(const std::string& path) {
   Status s = [&]() -> Status {
     DatabaseWriter db(layout, &sink);
     if (!db.status().ok()) return db.status();
-    StreamTable mailbox(&db, "Mailbox", MailboxSchema(options_.version), 0);
+    const uint32_t ids = real_ ? kLongValueId64Size : kLongValueIdSize;
+    StreamTable mailbox(&db, "Mailbox",
+                        real_ ? MailboxRealSchema() : MailboxSchema(options_.version), 0, ids);
     const uint32_t leaf = options_.max_rows_per_leaf;
-    for (const ManifestMailbox& mb : m.mailboxes) {
+    for (size_t i = 0; i < m.mailboxes.size(); ++i) {
+      const ManifestMailbox& mb = m.mailboxes[i];
       MailboxTables& t = tables_.emplace_back();
       if (!mb.damage.empty()) continue;
-      t.folders =
-          std::make_unique<StreamTable>(&db, mb.folder_table, FolderSchema(options_.version), 0);
-      t.messages = std::make_unique<StreamTable>(
-          &db, mb.message_table, modern_ ? Message2013Schema() : Body2010Schema(), leaf);
-      t.attachments = std::make_unique<StreamTable>(
-          &db, mb.attachment_table, modern_ ? Attachment2013Schema() : Attachment2010Schema(),
-          leaf);
+      t.folders = std::make_unique<StreamTable>(
+          &db, mb.folder_table, real_ ? FolderRealSchema() : FolderSchema(options_.version), 0,
+          ids);
+      t.messages = std::make_unique<StreamTable>(&db, mb.message_table,
+                                                 real_     ? MessageRealSchema()
+                                                 : modern_ ? Message2013Schema()
+                                                           : Body2010Schema(),
+                                                 leaf, ids);
+      t.attachments = std::make_unique<StreamTable>(&db, mb.attachment_table,
+                                                    real_     ? AttachmentRealSchema()
+                                                    : modern_ ? Attachment2013Schema()
+                                                              : Attachment2010Schema(),
+                                                    leaf, ids);
+      if (real_) t.named = std::make_unique<NamedNumbers>(i);
       if (!modern_) {
         t.headers = std::make_unique<StreamTable>(&db, mb.header_table, Header2010Schema(), leaf);
       }
@@ -1014,6 +1540,7 @@ Status ModernWriter::Write(const std::string& path) {
         if (st.ok() && table) st = table->Finish();
       }
     }
+    if (st.ok() && real_) st = WriteNameMappings(&db);
     if (!st.ok()) return st;
     Bytes header;
     Manifest pages;

@@ -57,6 +57,39 @@
 //     0x18, u16 size) or, past the long-value limit, in the long-value tree
 //     with every chunk compressed on its own.
 //   - Attachment "Content": in the record, or in the long-value tree when large.
+//
+// Real layout (code 5, `real_layout`): the tables as Exchange 2013, 2016 and
+// 2019 servers write them, file-format revision 110 with 8-byte long-value
+// ids and catalog records ending at fixed column 12:
+//   "Mailbox"          "MailboxNumber", "DisplayName", "MailboxOwnerDisplayName",
+//                      "PropertyBlob" (0x3001)
+//   "Folder_n"         "FolderId", "ParentFolderId" (26 bytes: 16-byte mailbox GUID,
+//                      6-byte big-endian counter, 4 zero bytes; the top folder's
+//                      parent all zeros), "DisplayName", "ContainerClass",
+//                      "SpecialFolderNumber", "PropertyBlob" (0x3001, 0x3613)
+//   "Message_n"        "MessageDocumentId", "MessageId" (26 bytes as folder ids),
+//                      "FolderId", "MessageClass", "IsRead", "HasAttachments",
+//                      "DateCreated", "DateReceived", "DateSent", "Importance",
+//                      "DisplayTo", "SubjectPrefix", "BodyType", "NativeBody",
+//                      "PropertyBlob" (0x0042, 0x0E1D, 0x0E07, 0x3008, 0x1000 of
+//                      any length, 0x007D), "OffPagePropertyBlob" (the item's own
+//                      values, named ones under the mailbox's numbers),
+//                      "RecipientList" (u32 count, then per recipient a u32
+//                      length and a blob: 0x0C15, 0x3001, 0x3002, 0x3003,
+//                      0x39FE), "SubobjectsBlob" (attachment Inids),
+//                      "SeparatedProperty01".."04" (far values, Xpress compressed)
+//   "Attachment_n"     "Inid", "Name", "ContentType", "Content", "Size",
+//                      "PropertyBlob" (0x3704, 0x3707, 0x3705, 0x0E20)
+//   "ExtendedPropertyNameMapping_n"  "PropNumber", "PropGuid", "PropName",
+//                      "PropDispId": each mailbox numbers the named properties
+//                      it uses on its own (from 0x8078, 0x8100 and 0x8000), and
+//                      every mailbox has an unknown named property at 0x8198,
+//                      set on its appointments, which a reader must not take
+//                      for the end time that number means elsewhere.
+// Blobs follow real_blob_encoder.h (3-byte entries; near and far values).
+// Items keep what the other code-5 layout keeps, and also 16-bit values,
+// doubles, distribution-list members (one-off entry ids), long plain bodies
+// and headers; the Cc line becomes Cc recipients, the To line To recipients.
 #ifndef TARNWELL_TESTING_EXCHANGE_MODERN_STORE_BUILDER_H_
 #define TARNWELL_TESTING_EXCHANGE_MODERN_STORE_BUILDER_H_
 
@@ -84,6 +117,7 @@ struct ModernDamageOptions {
 struct ModernStoreOptions {
   int version = kExchange2013;      // 3 or 5
   bool later_2013_variant = false;  // code 5: catalog records end at fixed column 12
+  bool real_layout = false;         // code 5 as servers write it (see above)
   ModernDamageOptions damage;
   BulkOptions bulk;
   bool record_items = true;  // off: folders carry counts only

@@ -16,8 +16,13 @@
 #include "base/paths.h"
 #include "base/text.h"
 #include "engine/column_decoder.h"
+#include "engine/column_value.h"
 #include "engine/edb_class.h"
+#include "engine/long_value.h"
+#include "store/property_blob.h"
+#include "store/real_property_blob.h"
 #include "testing/exchange/property_blob_encoder.h"
+#include "testing/exchange/real_blob_encoder.h"
 
 namespace tarnwell::forge::exchange {
 namespace {
@@ -487,6 +492,82 @@ TEST(PropertyBlobEncoderTest, RefusesValuesALengthByteCannotSay) {
   const BlobValues v = ParseBlob(blob.Finish());
   EXPECT_EQ(v.strings.at("Se1d"), std::string(kBlobMaxValueBytes, 'x'));
   EXPECT_EQ(v.numbers.at("B8124"), 1u);
+}
+
+// The server layout: revision 110 with 8-byte long-value ids, every blob of
+// the 3-byte-entry layout read whole, far values in their separated columns,
+// and libesedb accepting the file.
+TEST(RealLayoutStoreTest, RowsBlobsAndLongValuesAsServersWriteThem) {
+  ModernStoreOptions o;
+  o.real_layout = true;
+  Store store(o);
+  EXPECT_EQ(store.reader().header().format_revision, 110u);
+  size_t blobs = 0, far_values = 0, wide_ids = 0;
+  for (const ManifestMailbox& mb : store.manifest().mailboxes) {
+    for (const std::string& name : {mb.folder_table, mb.message_table, mb.attachment_table}) {
+      for (const Row& row : store.Read(name).rows) {
+        for (const char* column : {"PropertyBlob", "OffPagePropertyBlob"}) {
+          const Bytes b = Blob(row, column);
+          if (b.empty()) continue;
+          const store::RealBlob parsed = store::ParseRealBlob(b);
+          EXPECT_TRUE(parsed.complete) << name << " " << column << ": " << parsed.problem;
+          ++blobs;
+          for (store::BlobEntry e : parsed.entries) {
+            if (e.state != store::BlobValueState::kFarValue) continue;
+            ++far_values;
+            EXPECT_TRUE(
+                store::ResolveFarValue(Blob(row, store::SeparatedPropertyColumn(e.far_slot)), &e))
+                << e.name;
+          }
+        }
+        for (const auto& [column, flag] : row.flags) {
+          // A separated value's record holds its 8-byte long-value id.
+          if (flag & engine::kTaggedSeparated) {
+            wide_ids += row.raw.at(column).size() == engine::kLongValueId64Size;
+          }
+        }
+      }
+    }
+    EXPECT_NE(store.reader().FindTable("ExtendedPropertyNameMapping_" + std::to_string(mb.number)),
+              nullptr);
+  }
+  EXPECT_GT(blobs, 50u);
+  EXPECT_GT(far_values, 0u);
+  EXPECT_GT(wide_ids, 0u);
+  if (std::system("command -v esedbinfo >/dev/null 2>&1") == 0) {
+    EXPECT_EQ(std::system(("esedbinfo " + store.path() + " >/dev/null 2>&1").c_str()), 0);
+  }
+}
+
+// Values land inline, near or far by their size, and read back as written.
+TEST(RealBlobEncoderTest, PlacesValuesByTheirSize) {
+  struct Case {
+    size_t chars;
+    bool near;
+    bool far;
+  };
+  for (const Case& c : {Case{10, false, false}, Case{300, true, false}, Case{3000, false, true}}) {
+    SCOPED_TRACE(c.chars);
+    RealBlobEncoder e;
+    e.AddInt32(1, -70000);
+    e.AddString(0x1000, std::string(c.chars, 'x'));
+    e.AddMultiString(0x8002, {"a", "Grün"});
+    std::vector<SeparatedValue> separated;
+    const Bytes blob = e.Finish(&separated);
+    EXPECT_EQ(blob[4], c.near ? 0x01 : 0x00);
+    EXPECT_EQ(separated.size(), c.far ? 1u : 0u);
+    const store::RealBlob parsed = store::ParseRealBlob(blob);
+    ASSERT_TRUE(parsed.complete) << parsed.problem;
+    ASSERT_EQ(parsed.entries.size(), 3u);
+    EXPECT_EQ(LoadU32LE(parsed.entries[0].value.data()), uint32_t(-70000));
+    store::BlobEntry body = parsed.entries[1];
+    if (c.far) {
+      ASSERT_TRUE(store::ResolveFarValue(separated[0].encoded, &body));
+    }
+    EXPECT_EQ(body.value.size(), c.chars);
+    EXPECT_EQ(std::string(parsed.entries[2].value.begin(), parsed.entries[2].value.end()),
+              "a;Grün");
+  }
 }
 
 }  // namespace

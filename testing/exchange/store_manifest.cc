@@ -180,6 +180,7 @@ std::string ManifestJson(const StoreManifest& m) {
   }
   w.EndArray();
   w.Key("later_2013_variant").Bool(m.later_2013_variant);
+  w.Key("real_layout").Bool(m.real_layout);
   w.Key("unmapped").BeginArray();
   for (const DuplicateRow& d : m.unmapped) {
     w.BeginObject();

@@ -135,6 +135,9 @@ struct StoreManifest {
   bool items_recorded = true;  // false: folders carry counts only
   // Modern stores: catalog records end at fixed column 12 (later Exchange 2013).
   bool later_2013_variant = false;
+  // Code 5 written as servers write it (modern_store_builder.h): 26-byte
+  // ids, so folder ids, parents and item keys are the last 8 bytes of them.
+  bool real_layout = false;
   // Message rows whose key cannot be read (a "MessageId" of 8 bytes or
   // fewer); no folder lists them. Key = the whole "MessageId".
   std::vector<DuplicateRow> unmapped;
