@@ -28,6 +28,15 @@ Status EncodePropertyContext(const std::vector<TaggedValue>& properties, NodeCon
 // read and a Corruption status.
 Status DecodePropertyContext(const NodeContent& node, std::vector<TaggedValue>* out);
 
+// How a value looks when stored outside its record or cell (behind an
+// HNID), shared with table contexts: fixed-size and variable-size values as
+// they are, multi-valued fixed-size ones back to back, multi-valued
+// variable-size ones as a count, offsets and the elements.
+// InvalidArgument when `value` does not fit its own type.
+Status EncodeStoredValue(const PropertyValue& value, Bytes* out);
+// Corruption when `bytes` cannot be a value of `type`.
+Status DecodeStoredValue(uint16_t type, ByteView bytes, PropertyValue* out);
+
 }  // namespace tarnwell::mapi::pst
 
 #endif  // TARNWELL_MAPI_PST_PROPERTY_CONTEXT_H_
