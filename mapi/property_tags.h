@@ -121,6 +121,103 @@ extern const Guid kPsMapi;             // 00020328-0000-0000-C000-000000000046
 NamedProperty NamedId(const Guid& set, uint32_t lid);
 NamedProperty NamedString(const Guid& set, const std::string& name);
 
+// Used by the import of composed files and the class fillers.
+inline constexpr uint16_t kPidAlternateRecipientAllowed = 0x0002;
+inline constexpr uint16_t kPidDeferredDeliveryTime = 0x000F;
+inline constexpr uint16_t kPidOriginatorDeliveryReportRequested = 0x0023;
+inline constexpr uint16_t kPidReadReceiptRequested = 0x0029;
+inline constexpr uint16_t kPidRecipientReassignmentProhibited = 0x002B;
+inline constexpr uint16_t kPidStartDate = 0x0060;
+inline constexpr uint16_t kPidEndDate = 0x0061;
+inline constexpr uint16_t kPidInternetReferences = 0x1039;
+inline constexpr uint16_t kPidOriginalMessageId = 0x1046;
+inline constexpr uint16_t kPidConversationIndexTracking = 0x3016;
+inline constexpr uint16_t kPidDeferredSendTime = 0x3FEF;
+inline constexpr uint16_t kPidSentRepresentingSmtpAddress = 0x5D02;
+inline constexpr uint16_t kPidRecipientFlags = 0x5FFD;
+inline constexpr uint16_t kPidAttachmentHidden = 0x7FFE;
+inline constexpr uint16_t kPidAttachmentContactPhoto = 0x7FFF;
+inline constexpr uint16_t kPidChildrensNames = 0x3A58;
+
+// PidTagMessageFlags bits.
+inline constexpr int32_t kMsgFlagRead = 0x0001;
+inline constexpr int32_t kMsgFlagUnmodified = 0x0002;
+inline constexpr int32_t kMsgFlagHasAttach = 0x0010;
+// PidTagImportance values.
+inline constexpr int32_t kImportanceLow = 0;
+inline constexpr int32_t kImportanceNormal = 1;
+inline constexpr int32_t kImportanceHigh = 2;
+// PidTagObjectType of a recipient; PidTagRecipientFlags bits.
+inline constexpr int32_t kObjectTypeMailUser = 6;
+inline constexpr int32_t kRecipientFlagSendable = 0x0001;
+inline constexpr int32_t kRecipientFlagOrganizer = 0x0002;
+
+// Named properties by long id (LID), with the property set each belongs to.
+// PSETID_Appointment
+inline constexpr uint32_t kLidBusyStatus = 0x8205;
+inline constexpr uint32_t kLidLocation = 0x8208;
+inline constexpr uint32_t kLidAppointmentStartWhole = 0x820D;
+inline constexpr uint32_t kLidAppointmentEndWhole = 0x820E;
+inline constexpr uint32_t kLidAppointmentDuration = 0x8213;
+inline constexpr uint32_t kLidAppointmentSubType = 0x8215;
+inline constexpr uint32_t kLidAppointmentStateFlags = 0x8217;
+inline constexpr int32_t kAppointmentStateMeeting = 0x0001;
+// PSETID_Common
+inline constexpr uint32_t kLidCommonStart = 0x8516;
+inline constexpr uint32_t kLidCommonEnd = 0x8517;
+// PSETID_Task
+inline constexpr uint32_t kLidTaskStatus = 0x8101;
+inline constexpr uint32_t kLidPercentComplete = 0x8102;
+inline constexpr uint32_t kLidTaskStartDate = 0x8104;
+inline constexpr uint32_t kLidTaskDueDate = 0x8105;
+inline constexpr uint32_t kLidTaskDateCompleted = 0x810F;
+inline constexpr uint32_t kLidTaskComplete = 0x811C;
+inline constexpr int32_t kTaskStatusInProgress = 1;
+inline constexpr int32_t kTaskStatusComplete = 2;
+inline constexpr int32_t kTaskStatusWaiting = 3;
+inline constexpr int32_t kTaskStatusDeferred = 4;
+// PSETID_Address
+inline constexpr uint32_t kLidFileUnder = 0x8005;
+inline constexpr uint32_t kLidHasPicture = 0x8015;
+inline constexpr uint32_t kLidHomeAddress = 0x801A;
+inline constexpr uint32_t kLidWorkAddress = 0x801B;
+inline constexpr uint32_t kLidOtherAddress = 0x801C;
+inline constexpr uint32_t kLidAddressBookProviderEmailList = 0x8028;
+inline constexpr uint32_t kLidAddressBookProviderArrayType = 0x8029;
+inline constexpr uint32_t kLidWorkAddressStreet = 0x8045;
+inline constexpr uint32_t kLidWorkAddressCity = 0x8046;
+inline constexpr uint32_t kLidWorkAddressState = 0x8047;
+inline constexpr uint32_t kLidWorkAddressPostalCode = 0x8048;
+inline constexpr uint32_t kLidWorkAddressCountry = 0x8049;
+inline constexpr uint32_t kLidWorkAddressPostOfficeBox = 0x804A;
+inline constexpr uint32_t kLidDistributionListChecksum = 0x804C;
+inline constexpr uint32_t kLidDistributionListName = 0x8053;
+inline constexpr uint32_t kLidDistributionListOneOffMembers = 0x8054;
+inline constexpr uint32_t kLidDistributionListMembers = 0x8055;
+inline constexpr uint32_t kLidInstantMessagingAddress = 0x8062;
+// Email1; Email2 and Email3 follow at +0x10 and +0x20.
+inline constexpr uint32_t kLidEmail1DisplayName = 0x8080;
+inline constexpr uint32_t kLidEmail1AddressType = 0x8082;
+inline constexpr uint32_t kLidEmail1EmailAddress = 0x8083;
+inline constexpr uint32_t kLidEmail1OriginalDisplayName = 0x8084;
+inline constexpr uint32_t kLidEmail1OriginalEntryId = 0x8085;
+inline constexpr uint32_t kLidEmailStride = 0x10;
+inline constexpr uint32_t kLidFreeBusyLocation = 0x80D8;
+inline constexpr uint32_t kLidBirthdayLocal = 0x80DE;
+inline constexpr uint32_t kLidWeddingAnniversaryLocal = 0x80DF;
+// PSETID_Note
+inline constexpr uint32_t kLidNoteColor = 0x8B00;
+inline constexpr uint32_t kLidNoteWidth = 0x8B02;
+inline constexpr uint32_t kLidNoteHeight = 0x8B03;
+inline constexpr uint32_t kLidNoteX = 0x8B04;
+inline constexpr uint32_t kLidNoteY = 0x8B05;
+// PSETID_Log
+inline constexpr uint32_t kLidLogType = 0x8700;
+inline constexpr uint32_t kLidLogStart = 0x8706;
+inline constexpr uint32_t kLidLogDuration = 0x8707;
+inline constexpr uint32_t kLidLogEnd = 0x8708;
+inline constexpr uint32_t kLidLogTypeDesc = 0x8712;
+
 }  // namespace tarnwell::mapi
 
 #endif  // TARNWELL_MAPI_PROPERTY_TAGS_H_
