@@ -15,7 +15,8 @@ build: setup
 
 # The main job on a bundled sample: an Exchange 2007 mailbox database the
 # test store builder generates at build time, scanned, its Inbox listed,
-# and every folder exported to EML files below build/demo-export.
+# and every folder exported to EML files below build/demo-export and to a
+# PST file in build/demo-pst.
 demo: build
 	$(BUILD)/cli/tarnwell info $(BUILD)/samples/exchange2007.edb
 	$(BUILD)/cli/tarnwell scan $(BUILD)/samples/exchange2007.edb
@@ -23,6 +24,9 @@ demo: build
 	mkdir -p $(BUILD)/demo-export
 	$(BUILD)/cli/tarnwell export $(BUILD)/samples/exchange2007.edb --to eml --hierarchy \
 	    --out $(BUILD)/demo-export --log-dir $(BUILD)/demo-export
+	rm -rf $(BUILD)/demo-pst && mkdir -p $(BUILD)/demo-pst
+	$(BUILD)/cli/tarnwell export $(BUILD)/samples/exchange2007.edb --to pst \
+	    --out $(BUILD)/demo-pst --log-dir $(BUILD)/demo-pst
 
 test: build
 	ctest --test-dir $(BUILD) --output-on-failure -j $(JOBS)

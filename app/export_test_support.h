@@ -29,8 +29,8 @@ inline bool HavePython() {
 // Runs `/usr/bin/python3 SCRIPT ARGS...`; a failure shows the script's report.
 inline void RunChecker(const std::string& script, const std::vector<std::string>& args,
                        const std::string& report) {
-  std::string cmd = "/usr/bin/python3 '" + std::string(TARNWELL_SOURCE_DIR) + "/app/testdata/" +
-                    script + "'";
+  std::string cmd =
+      "/usr/bin/python3 '" + std::string(TARNWELL_SOURCE_DIR) + "/app/testdata/" + script + "'";
   for (const std::string& a : args) cmd += " '" + a + "'";
   cmd += " > '" + report + "' 2>&1";
   const int rc = std::system(cmd.c_str());
@@ -122,7 +122,8 @@ class ScannedStoreTest : public ::testing::TestWithParam<StoreCase> {
   void TearDown() override {
     source_.store.reset();
     source_.reader.reset();
-    if (!dir_.empty()) std::filesystem::remove_all(dir_);
+    if (!dir_.empty() && !std::getenv("TARNWELL_KEEP_TEST_FILES"))
+      std::filesystem::remove_all(dir_);
   }
 
   std::string dir_, manifest_path_;

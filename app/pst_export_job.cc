@@ -1,5 +1,8 @@
 #include "app/pst_export_job.h"
 
+#include <locale.h>
+#include <wctype.h>
+
 #include <filesystem>
 
 #include "app/item_render.h"
@@ -7,6 +10,7 @@
 #include "base/text.h"
 #include "export/export_log.h"
 #include "mapi/import/class_fillers.h"
+#include "mapi/property_tags.h"
 #include "mapi/session.h"
 #include "render/mime/mime_sink.h"
 
@@ -27,11 +31,17 @@ std::string JoinPath(const std::vector<std::string>& path, size_t from) {
   return out;
 }
 
-std::string AsciiUpper(std::string text) {
-  for (char& c : text) {
-    if (c >= 'a' && c <= 'z') c = char(c - 'a' + 'A');
+// Upper case for every script the C.UTF-8 locale knows, not only ASCII.
+std::string Upper(const std::string& text) {
+  static const locale_t utf8 = newlocale(LC_CTYPE_MASK, "C.UTF-8", locale_t(0));
+  std::string out;
+  size_t pos = 0;
+  while (pos < text.size()) {
+    char32_t cp = DecodeUtf8(text, &pos);
+    if (utf8) cp = char32_t(towupper_l(wint_t(cp), utf8));
+    AppendUtf8(cp, &out);
   }
-  return text;
+  return out;
 }
 
 // Where an item of a class goes: the mirrored folder, or a default folder.
@@ -54,6 +64,19 @@ std::optional<mapi::DefaultFolderKind> DefaultFolderFor(const std::string& messa
       return std::nullopt;
     default:
       return std::nullopt;
+  }
+}
+
+void AddAttachments(std::vector<store::AttachmentRecord>& attachments, mapi::Message* message) {
+  for (store::AttachmentRecord& a : attachments) {
+    mapi::Attachment out;
+    const std::string name = a.name.empty() ? "Unknown" : ToValidUtf8(a.name);
+    out.properties.Set(mapi::kPidAttachMethod, mapi::PropertyValue::Int32(mapi::kAttachByValue));
+    out.properties.Set(mapi::kPidAttachLongFilename, mapi::PropertyValue::Unicode(name));
+    out.properties.Set(mapi::kPidAttachFilename, mapi::PropertyValue::Unicode(name));
+    out.properties.Set(mapi::kPidDisplayName, mapi::PropertyValue::Unicode(name));
+    out.data = std::move(a.data);
+    message->attachments.push_back(std::move(out));
   }
 }
 
@@ -150,9 +173,9 @@ class PstWriter {
     Status s = session_.Logoff();
     if (!s.ok()) log_.Error(s.message() + "\r\n");
     pst_bytes_ = kEmptyPstBytes;
-    const std::string folder =
-        options_.pst_mode == 2 ? fs::path(options_.existing_pst).parent_path().string()
-                               : options_.save_path;
+    const std::string folder = options_.pst_mode == 2
+                                   ? fs::path(options_.existing_pst).parent_path().string()
+                                   : options_.save_path;
     const std::string name = options_.pst_mode == 2
                                  ? fs::path(options_.existing_pst).filename().string()
                                  : PstFileName(base_name_);
@@ -217,6 +240,9 @@ class PstWriter {
     Status s = pst_item->ImportBytes(composed);
     if (!s.ok()) return s;
     composed = Bytes();
+    // A vCard or iCalendar file has no room for attachments: they come from
+    // the item itself.
+    if (!item.native.empty()) AddAttachments(item.attachments, &pst_item->message());
     mapi::FillFromRecords(item.records, *item.row, item.message_class, &pst_item->message());
     s = pst_item->Save();
     if (!s.ok()) return s;
@@ -244,7 +270,7 @@ class PstWriter {
 std::string PstFileName(const std::string& base_name) {
   size_t cut = base_name.find_last_of("\\/");
   std::string name = cut == std::string::npos ? base_name : base_name.substr(cut + 1);
-  return SafeFileName(AsciiUpper(name + ".pst"));
+  return SafeFileName(Upper(name + ".pst"));
 }
 
 std::string FreePstPath(const std::string& folder, const std::string& name) {

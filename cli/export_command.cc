@@ -5,9 +5,7 @@
 #include "app/check_tree_model.h"
 #include "app/export_options.h"
 #include "app/file_export_job.h"
-#ifdef TARNWELL_HAVE_PST
 #include "app/pst_export_job.h"
-#endif
 
 namespace tarnwell::cli {
 namespace {
@@ -159,7 +157,6 @@ Status RunExport(const ExportCommandOptions& o, ProgressSink& progress, ExportSu
   s = CheckedFolders(session, o.folders, &folders);
   if (!s.ok()) return s;
   session.BeginJob();
-#ifdef TARNWELL_HAVE_PST
   if (options.pst_target) {
     app::PstExportRequest request;
     request.options = options;
@@ -181,9 +178,6 @@ Status RunExport(const ExportCommandOptions& o, ProgressSink& progress, ExportSu
     }
     return Status::Ok();
   }
-#else
-  if (options.pst_target) return Status::NotSupported("PST export is not built in");
-#endif
   app::FileExportRequest request;
   request.options = options;
   request.folders = std::move(folders);

@@ -339,17 +339,28 @@ int AppendSubject(C c, R r) {
 
 // Plain text becomes the body only when no other body came first.
 int SetTextBody(C c, R r) {
-  if (!r->message.body.empty()) return 0;
   std::string text;
   const int k = AsText(c, &text);
   if (k <= 0) return k;
+  if (!r->message.body.empty()) {
+    // With an HTML body in place the text still counts: a PST item carries both.
+    if (!r->message.body_is_text) r->message.strings["S1000"] = std::move(text);
+    return 0;
+  }
   r->message.body.assign(text.begin(), text.end());
   r->message.body_is_text = true;
   return 1;
 }
 
 int SetNativeBody(C c, R r) {
-  r->message.body = c.value.ToBytes();
+  Bytes native = c.value.ToBytes();
+  // A native body that is not the text itself (HTML) leaves the text among
+  // the strings: a PST item carries both.
+  if (r->message.body_is_text && !r->message.body.empty() && native != r->message.body) {
+    const std::string text(r->message.body.begin(), r->message.body.end());
+    if (native != Utf8ToUtf16LE(text)) r->message.strings["S1000"] = text;
+  }
+  r->message.body = std::move(native);
   r->message.body_is_text = false;
   return 1;
 }

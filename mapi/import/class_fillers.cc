@@ -185,8 +185,14 @@ void FillMessageRecord(const store::MessageRecord& r, PropertyBag* bag) {
     SetText(bag, kPidConversationTopic, it->second);
   }
   // A plain-text body does not travel in the composed file when the item has an RTF body.
-  if (r.body_is_text && !bag->Find(kPidBody)) {
-    SetText(bag, kPidBody, std::string(ByteView(r.body).ToString()));
+  // Nor does it when the item has an HTML body: the text then stays among
+  // the record's other strings.
+  if (!bag->Find(kPidBody)) {
+    if (r.body_is_text) {
+      SetText(bag, kPidBody, std::string(ByteView(r.body).ToString()));
+    } else if (auto it = r.strings.find("S1000"); it != r.strings.end() && !it->second.empty()) {
+      SetText(bag, kPidBody, it->second);
+    }
   }
 }
 

@@ -256,8 +256,32 @@ class AddressListParser {
   int comment_depth_ = 0;
 };
 
+// A list with no address at all (and no group) is a list of display names
+// as Exchange shows them: separated by semicolons, while a comma belongs to a name
+// ("Müller, Jürgen").
 std::vector<Mailbox> ParseAddressList(const std::string* value) {
   if (!value) return {};
+  if (value->find_first_of("@<:") == std::string::npos) {
+    // Quotes only protect the specials inside a name; they are not part of it.
+    std::string text;
+    for (size_t i = 0; i < value->size(); ++i) {
+      if ((*value)[i] == '\\' && i + 1 < value->size()) {
+        text.push_back((*value)[++i]);
+      } else if ((*value)[i] != '"') {
+        text.push_back((*value)[i]);
+      }
+    }
+    std::vector<Mailbox> names;
+    size_t at = 0;
+    while (at <= text.size() && names.size() < kMaxRecipients) {
+      size_t end = text.find(';', at);
+      if (end == std::string::npos) end = text.size();
+      std::string name = CollapseBlanks(std::string_view(text).substr(at, end - at));
+      if (!name.empty()) names.push_back({std::move(name), ""});
+      at = end + 1;
+    }
+    return names;
+  }
   return AddressListParser().Parse(*value);
 }
 

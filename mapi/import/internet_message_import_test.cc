@@ -432,3 +432,33 @@ TEST(OneOffEntryId, Layout) {
 
 }  // namespace
 }  // namespace tarnwell::mapi
+
+namespace tarnwell::mapi {
+namespace {
+
+// The database's display lines carry names without addresses: semicolons
+// separate them, a comma belongs to a name.
+TEST(InternetMessageImport, DisplayNamesWithoutAddresses) {
+  struct Case {
+    const char* to;
+    std::vector<std::string> names;
+  };
+  for (const Case& c : {Case{"M\xC3\xBCller, J\xC3\xBCrgen", {"M\xC3\xBCller, J\xC3\xBCrgen"}},
+                        Case{"\xD0\x9F\xD1\x91\xD1\x82\xD1\x80; Anna B",
+                             {"\xD0\x9F\xD1\x91\xD1\x82\xD1\x80", "Anna B"}}}) {
+    store::MessageRecord record;
+    record.body = {'x'};
+    record.body_is_text = true;
+    render::HeaderStrings h;
+    h.to = c.to;
+    h.subject = "s";
+    const Message m = Import(Compose(record, {}, h));
+    std::vector<std::string> names;
+    for (const PropertyBag& r : m.recipients)
+      names.push_back(r.String(kPidDisplayName).value_or(""));
+    EXPECT_EQ(names, c.names) << c.to;
+  }
+}
+
+}  // namespace
+}  // namespace tarnwell::mapi
