@@ -26,6 +26,8 @@
 #include "engine/edb_class.h"
 #include "fuzz/fuzz_columns.h"
 #include "fuzz/memfd_database.h"
+#include "mapi/property_tags.h"
+#include "mapi/pst/pst_store.h"
 #include "testing/encoders/lz4_value_encoder.h"
 #include "testing/encoders/seven_bit_encoder.h"
 #include "testing/encoders/xpress_encoder.h"
@@ -70,6 +72,7 @@ class Corpus {
     return false;
   }
   bool failed() const { return failed_; }
+  const std::string& root() const { return root_; }
   size_t written() const { return written_; }
 
  private:
@@ -314,6 +317,55 @@ void WriteMessagesAndBlobs(Corpus* corpus) {
   corpus->Put("blob", "real", real);
 }
 
+// A small PST with a folder and a message with a recipient and an
+// attachment, and the composed files the importers read.
+void WritePstAndImports(Corpus* corpus) {
+  const std::string path = corpus->root() + "/seed.pst.tmp";
+  std::remove(path.c_str());
+  {
+    std::unique_ptr<mapi::pst::PstStore> store;
+    if (!mapi::pst::PstStore::Create(path, "Seeds", &store).ok()) {
+      corpus->Fail("cannot write a PST seed");
+      return;
+    }
+    mapi::pst::Nid folder = 0, message = 0;
+    uint64_t size = 0;
+    store->AddFolder(store->top_folder(), "Inbox", "", &folder);
+    mapi::Message m;
+    m.properties.Set(mapi::kPidMessageClass, mapi::PropertyValue::Unicode("IPM.Note"));
+    m.properties.Set(mapi::kPidSubject, mapi::PropertyValue::Unicode("seed"));
+    mapi::PropertyBag to;
+    to.Set(mapi::kPidRecipientType, mapi::PropertyValue::Int32(mapi::kRecipientTo));
+    to.Set(mapi::kPidDisplayName, mapi::PropertyValue::Unicode("a@example.com"));
+    m.recipients.push_back(to);
+    mapi::Attachment a;
+    a.properties.Set(mapi::kPidAttachMethod, mapi::PropertyValue::Int32(mapi::kAttachByValue));
+    a.data = forge::Ascii("attachment");
+    m.attachments.push_back(std::move(a));
+    store->AddMessage(folder, m, &message, &size);
+    store->Commit();
+  }
+  std::FILE* f = std::fopen(path.c_str(), "rb");
+  Bytes bytes;
+  if (f) {
+    int c;
+    while ((c = std::fgetc(f)) != EOF) bytes.push_back(uint8_t(c));
+    std::fclose(f);
+  }
+  std::remove(path.c_str());
+  corpus->Put("pst", "small", bytes);
+  corpus->Put("import", "vcard",
+              forge::Ascii("BEGIN:VCARD\r\nVERSION:2.1\r\nN:Doe;John\r\nFN:John Doe\r\n"
+                           "EMAIL;INTERNET:j@example.com\r\nEND:VCARD\r\n"));
+  corpus->Put("import", "ical",
+              forge::Ascii("BEGIN:VCALENDAR\r\nVERSION:2.0\r\nBEGIN:VEVENT\r\n"
+                           "DTSTART:20210101T100000Z\r\nDTEND:20210101T110000Z\r\n"
+                           "SUMMARY:Meeting\r\nEND:VEVENT\r\nEND:VCALENDAR\r\n"));
+  corpus->Put("import", "mail",
+              forge::Ascii("From: a@example.com\r\nTo: \"B, C\" <b@example.com>\r\n"
+                           "Subject: s\r\nContent-Type: text/plain\r\n\r\nbody\r\n"));
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
@@ -326,6 +378,7 @@ int main(int argc, char** argv) {
   WriteRecords(&corpus);
   WriteCompressed(&corpus);
   WriteMessagesAndBlobs(&corpus);
+  WritePstAndImports(&corpus);
   std::printf("make_seed_corpus: %zu seeds in %s\n", corpus.written(), argv[1]);
   return corpus.failed() ? 1 : 0;
 }
