@@ -739,31 +739,31 @@ Status PstStore::AddFolder(Nid parent, const std::string& name, const std::strin
 }
 
 Status PstStore::GetDefaultFolder(DefaultFolder kind, Nid* out) {
-  struct Spec {
+  struct Traits {
     uint16_t property;
     const char* name;
     const char* container_class;
   };
-  Spec spec;
+  Traits traits;
   switch (kind) {
     case DefaultFolder::kCalendar:
-      spec = {kPidIpmAppointmentEntryId, "Calendar", "IPF.Appointment"};
+      traits = {kPidIpmAppointmentEntryId, "Calendar", "IPF.Appointment"};
       break;
     case DefaultFolder::kContacts:
-      spec = {kPidIpmContactEntryId, "Contacts", "IPF.Contact"};
+      traits = {kPidIpmContactEntryId, "Contacts", "IPF.Contact"};
       break;
     case DefaultFolder::kJournal:
-      spec = {kPidIpmJournalEntryId, "Journal", "IPF.Journal"};
+      traits = {kPidIpmJournalEntryId, "Journal", "IPF.Journal"};
       break;
     case DefaultFolder::kNotes:
-      spec = {kPidIpmNoteEntryId, "Notes", "IPF.StickyNote"};
+      traits = {kPidIpmNoteEntryId, "Notes", "IPF.StickyNote"};
       break;
     case DefaultFolder::kTasks:
-      spec = {kPidIpmTaskEntryId, "Tasks", "IPF.Task"};
+      traits = {kPidIpmTaskEntryId, "Tasks", "IPF.Task"};
       break;
     case DefaultFolder::kDeletedItems:
     default:
-      spec = {kPidIpmWastebasketEntryId, "Deleted Items", ""};
+      traits = {kPidIpmWastebasketEntryId, "Deleted Items", ""};
       break;
   }
   // The wastebasket is named by the store; the other special folders by
@@ -771,15 +771,15 @@ Status PstStore::GetDefaultFolder(DefaultFolder kind, Nid* out) {
   bool on_store = kind == DefaultFolder::kDeletedItems;
   Nid found = 0;
   if (on_store) {
-    found = impl_->FolderFromProperty(impl_->store_properties, spec.property);
+    found = impl_->FolderFromProperty(impl_->store_properties, traits.property);
   } else {
     auto it = impl_->folders.find(kNidRootFolder);
     if (it != impl_->folders.end()) {
-      found = impl_->FolderFromProperty(it->second.properties, spec.property);
+      found = impl_->FolderFromProperty(it->second.properties, traits.property);
     } else {
       std::vector<TaggedValue> props;
       impl_->ReadProperties(kNidRootFolder, &props);
-      found = impl_->FolderFromProperty(props, spec.property);
+      found = impl_->FolderFromProperty(props, traits.property);
     }
   }
   if (found != 0) {
@@ -788,26 +788,26 @@ Status PstStore::GetDefaultFolder(DefaultFolder kind, Nid* out) {
   }
   // A file without the pointer may still have the folder by its name.
   for (const FolderInfo& f : SubFolders(impl_->top)) {
-    if (f.name == spec.name && NidTypeOf(f.nid) == kNidTypeNormalFolder) found = f.nid;
+    if (f.name == traits.name && NidTypeOf(f.nid) == kNidTypeNormalFolder) found = f.nid;
   }
   if (!impl_->file->writable()) {
-    if (found == 0) return Status::NotFound(std::string("no ") + spec.name + " folder");
+    if (found == 0) return Status::NotFound(std::string("no ") + traits.name + " folder");
     *out = found;
     return Status::Ok();
   }
   if (found == 0) {
-    Status s = AddFolder(impl_->top, spec.name, spec.container_class, &found);
+    Status s = AddFolder(impl_->top, traits.name, traits.container_class, &found);
     if (!s.ok()) return s;
   }
   PropertyValue entry_id = PropertyValue::Binary(EntryId(found));
   if (on_store) {
-    SetTagged(&impl_->store_properties, spec.property, std::move(entry_id));
+    SetTagged(&impl_->store_properties, traits.property, std::move(entry_id));
     impl_->store_dirty = true;
   } else {
     FolderState* root = nullptr;
     Status s = impl_->LoadFolder(kNidRootFolder, &root);
     if (!s.ok()) return s;
-    SetTagged(&root->properties, spec.property, std::move(entry_id));
+    SetTagged(&root->properties, traits.property, std::move(entry_id));
     root->properties_dirty = true;
   }
   *out = found;
