@@ -81,6 +81,15 @@ struct StoreCase {
   bool real_layout = false;  // version 5 as Exchange 2013-2019 servers write it
 };
 
+// One store of every version code and layout.
+inline const std::vector<StoreCase> kEveryStore = {{"v55", 4},
+                                                   {"v2003", 1},
+                                                   {"v2007", 2},
+                                                   {"v2003_public", 1, true},
+                                                   {"v2010", 3},
+                                                   {"v2013", 5},
+                                                   {"v2013_real", 5, false, true}};
+
 inline std::string StoreCaseName(const ::testing::TestParamInfo<StoreCase>& info) {
   return info.param.name;
 }

@@ -118,14 +118,7 @@ TEST_P(FileExportTest, DateFilterAndStop) {
   }
 }
 
-INSTANTIATE_TEST_SUITE_P(Stores, FileExportTest,
-                         ::testing::Values(StoreCase{"v55", 4, false}, StoreCase{"v2003", 1, false},
-                                           StoreCase{"v2007", 2, false},
-                                           StoreCase{"v2003_public", 1, true},
-                                           StoreCase{"v2010", 3, false},
-                                           StoreCase{"v2013", 5, false},
-                                           StoreCase{"v2013_real", 5, false, true}),
-                         StoreCaseName);
+INSTANTIATE_TEST_SUITE_P(Stores, FileExportTest, ::testing::ValuesIn(kEveryStore), StoreCaseName);
 
 TEST(ItemFileNameTest, ForbiddenCharactersCounterAndCuts) {
   store::MessageSummary row;

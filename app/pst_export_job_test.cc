@@ -121,14 +121,7 @@ TEST_P(PstExportTest, SplitBySizeAndByMailbox) {
   EXPECT_EQ(CountMessages(users.files), Saved(users));
 }
 
-INSTANTIATE_TEST_SUITE_P(Stores, PstExportTest,
-                         ::testing::Values(StoreCase{"v55", 4, false}, StoreCase{"v2003", 1, false},
-                                           StoreCase{"v2007", 2, false},
-                                           StoreCase{"v2003_public", 1, true},
-                                           StoreCase{"v2010", 3, false},
-                                           StoreCase{"v2013", 5, false},
-                                           StoreCase{"v2013_real", 5, false, true}),
-                         StoreCaseName);
+INSTANTIATE_TEST_SUITE_P(Stores, PstExportTest, ::testing::ValuesIn(kEveryStore), StoreCaseName);
 
 // Adding to a PST written by another program keeps its items; a second run
 // reuses the folders the first made.
