@@ -8,14 +8,11 @@
 
 #include <cstdio>
 #include <filesystem>
-#include <memory>
-#include <ostream>
+#include <fstream>
+#include <iterator>
 #include <string>
 
-#include "base/paths.h"
-#include "engine/catalog.h"
-#include "engine/edb_class.h"
-#include "testing/ese_writer.h"
+#include "engine/engine_test_support.h"
 #include "testing/forge_record.h"
 #include "testing/forge_value.h"
 
@@ -25,31 +22,15 @@ namespace {
 using Kind = DecodedColumn::Kind;
 using forge::Compression;
 
-struct Format {
-  const char* name;
-  uint32_t page_size;
-  uint32_t revision;
-};
-
-const Format kFormats[] = {{"4k", 4096, 9}, {"8k", 8192, 12}, {"32k", 32768, 17}};
-void PrintTo(const Format& f, std::ostream* os) { *os << f.name; }
-
 constexpr uint32_t kColumnFlagMultiValued = 0x400;
 constexpr uint32_t kIdColumn = 1;
 constexpr uint64_t kAttachmentLv = 9;
-
-// What the decoder should make of one stored value.
-struct Expect {
-  Kind kind;
-  std::string text;  // kText, kUnsupported: the text; kMulti: elements' text, '|'-joined
-  Bytes bytes;       // kBinary
-};
 
 struct ValueCase {
   const char* name;
   forge::ColumnLayout column;
   forge::Cell cell;
-  Expect expect;
+  std::string expect;  // what the decoder makes of the value, as Render shows it
 };
 
 const std::string kAsciiText =
@@ -70,69 +51,68 @@ forge::Cell Compressed(uint32_t column, const Bytes& plain, Compression scheme) 
   return cell;
 }
 
+const std::string kAttachment = "an attachment that lives in the long-value tree";
+
 std::vector<ValueCase> Cases() {
-  const Bytes attachment = forge::Ascii("an attachment that lives in the long-value tree");
   return {
       {"seven_bit_ascii",
        {256, "AsciiText", forge::kColumnLongText, 0, 1252},
        Compressed(256, forge::Ascii(kAsciiText), Compression::kSevenBitAscii),
-       {Kind::kText, kAsciiText, {}}},
+       "text " + kAsciiText},
       {"seven_bit_unicode",
        {257, "UnicodeText", forge::kColumnLongText, 0, 1200},
        Compressed(257, forge::Utf16(kAsciiText), Compression::kSevenBitUnicode),
-       {Kind::kText, kAsciiText, {}}},
+       "text " + kAsciiText},
       {"seven_bit_unicode_in_an_8_bit_column",
        {258, "Subject", forge::kColumnText, 255, 1252},
        Compressed(258, forge::Utf16("Re: status"), Compression::kSevenBitUnicode),
-       {Kind::kText, "Re: status", {}}},
+       "text Re: status"},
       {"xpress_text",
        {259, "XpressText", forge::kColumnLongText, 0, 1200},
        Compressed(259, forge::Utf16(kLongText), Compression::kXpress),
-       {Kind::kText, kLongText, {}}},
+       "text " + kLongText},
       {"xpress_binary",
        {260, "XpressBlob", forge::kColumnLongBinary},
        Compressed(260, Blob(600), Compression::kXpress),
-       {Kind::kBinary, "", Blob(600)}},
+       "binary " + ToHex(ByteView(Blob(600)))},
       {"lz4_binary",
        {261, "Lz4Blob", forge::kColumnLongBinary},
        Compressed(261, Blob(700), Compression::kLz4),
-       {Kind::kBinary, "", Blob(700)}},
+       "binary " + ToHex(ByteView(Blob(700)))},
       {"lz4_text",
        {262, "Lz4Text", forge::kColumnLongText, 0, 1252},
        Compressed(262, forge::Ascii(kLongText), Compression::kLz4),
-       {Kind::kText, kLongText, {}}},
+       "text " + kLongText},
       {"xpress9_is_unsupported",
        {263, "Xpress9Blob", forge::kColumnLongBinary},
        Compressed(263, Blob(100), Compression::kXpress9),
-       {Kind::kUnsupported, "unsupported compression: Xpress9", {}}},
+       "unsupported unsupported compression: Xpress9"},
       {"multi_valued_text",
        {264, "Keywords", forge::kColumnText, 255, 1252, kColumnFlagMultiValued},
        forge::MultiValueCell(
            264, {{forge::Ascii("red")}, {forge::Ascii("")}, {forge::Ascii("green and blue")}}),
-       {Kind::kMulti, "red||green and blue", {}}},
+       "multi text red|text |text green and blue"},
       {"multi_valued_long",
        {265, "Numbers", forge::kColumnLong, 0, 0, kColumnFlagMultiValued},
        forge::MultiValueCell(265, {{forge::LittleEndian(7, 4)},
                                    {forge::LittleEndian(uint32_t(-2), 4)},
                                    {forge::LittleEndian(100000, 4)}}),
-       {Kind::kMulti, "7|-2|100000", {}}},
+       "multi signed 7|signed -2|signed 100000"},
       {"multi_valued_with_a_separated_element",
        {266, "Parts", forge::kColumnLongText, 0, 1252, kColumnFlagMultiValued},
        forge::MultiValueCell(266, {{forge::Ascii("inline part")},
                                    {forge::LongValueId(kAttachmentLv), true},
                                    {forge::Ascii("last")}}),
-       {Kind::kMulti,
-        "inline part|" + std::string(attachment.begin(), attachment.end()) + "|last",
-        {}}},
+       "multi text inline part|text " + kAttachment + "|text last"},
       {"two_values",
        {267, "Pair", forge::kColumnText, 255, 1252, kColumnFlagMultiValued},
        {267, forge::EncodeTwoValues(forge::Ascii("first"), forge::Ascii("second value")),
         forge::kTaggedTwoValues},
-       {Kind::kMulti, "first|second value", {}}},
+       "multi text first|text second value"},
       {"separated_text",
        {268, "Body", forge::kColumnLongText, 0, 1252},
        forge::SeparatedCell(268, kAttachmentLv),
-       {Kind::kText, std::string(attachment.begin(), attachment.end()), {}}},
+       "text " + kAttachment},
   };
 }
 
@@ -154,40 +134,40 @@ forge::DatabaseLayout ValuesDatabase(const Format& f, const std::vector<ValueCas
   }
   forge::LongValueLayout lv;
   lv.id = kAttachmentLv;
-  lv.data = forge::Ascii("an attachment that lives in the long-value tree");
+  lv.data = forge::Ascii(kAttachment);
   t.long_values.push_back(lv);
   layout.tables.push_back(std::move(t));
   return layout;
 }
 
-std::string ElementText(const DecodedColumn& d) {
+// The kind and the value of a decoded column; a list's elements '|'-joined.
+std::string Render(const DecodedColumn& d) {
   switch (d.kind) {
     case Kind::kText:
-      return d.text;
+      return "text " + d.text;
     case Kind::kSigned:
-      return std::to_string(d.i);
+      return "signed " + std::to_string(d.i);
+    case Kind::kBinary:
+      return "binary " + ToHex(ByteView(d.bytes));
+    case Kind::kUnsupported:
+      return "unsupported " + d.text;
+    case Kind::kMulti: {
+      std::string joined = "multi ";
+      for (size_t k = 0; k < d.values.size(); ++k) joined += (k ? "|" : "") + Render(d.values[k]);
+      return joined;
+    }
     default:
-      return "<kind " + std::to_string(int(d.kind)) + ": " + d.text + ">";
+      return "kind " + std::to_string(int(d.kind)) + " " + d.text;
   }
 }
 
-class ColumnDecoderTest : public ::testing::TestWithParam<Format> {
- protected:
-  void SetUp() override {
-    ASSERT_TRUE(MakeTempDir("tarnwell-values", &dir_).ok());
-    path_ = dir_ + "/values.edb";
-    ASSERT_TRUE(forge::WriteDatabase(ValuesDatabase(GetParam(), Cases()), path_).ok());
-  }
-  void TearDown() override { std::filesystem::remove_all(dir_); }
-  std::string dir_, path_;
-};
+class ColumnDecoderTest : public ::testing::TestWithParam<Format> {};
 
 TEST_P(ColumnDecoderTest, StoredFormsDecodeToTheirValues) {
   const std::vector<ValueCase> cases = Cases();
-  std::unique_ptr<EdbClass> reader;
-  ASSERT_TRUE(InspectDatabase(path_, &reader).ok());
-  ASSERT_EQ(reader->CollectTreeRecords(kCatalogRootPage), 1);
-  reader->ParseCatalogRecords();
+  TempDatabase db(ValuesDatabase(GetParam(), cases));
+  std::unique_ptr<EdbClass> reader = OpenWithCatalog(db.path());
+  ASSERT_TRUE(reader);
   const TableDef* table = reader->FindTable("Values");
   ASSERT_TRUE(table && table->long_value);
   ASSERT_EQ(table->columns.size(), cases.size() + 1);
@@ -195,36 +175,21 @@ TEST_P(ColumnDecoderTest, StoredFormsDecodeToTheirValues) {
   const ColumnDecoder decoder(&lvs, table->long_value->root_page());
 
   size_t row = 0;
-  ASSERT_EQ(reader->ForEachRecord(*table,
-                                  [&](const RecordRef&, RecordColumns& columns) {
-                                    if (row >= cases.size()) return false;
-                                    const ValueCase& c = cases[row];
-                                    SCOPED_TRACE(c.name);
-                                    for (size_t i = 1; i < table->columns.size(); ++i) {
-                                      const DecodedColumn d =
-                                          decoder.Decode(table->columns[i], columns.at(i));
-                                      if (i != row + 1) {
-                                        EXPECT_EQ(d.kind, Kind::kAbsent) << "column " << i;
-                                        continue;
-                                      }
-                                      EXPECT_EQ(d.kind, c.expect.kind) << d.text;
-                                      if (d.kind != c.expect.kind) continue;
-                                      if (d.kind == Kind::kBinary) {
-                                        EXPECT_EQ(d.bytes, c.expect.bytes);
-                                      } else if (d.kind == Kind::kMulti) {
-                                        std::string joined;
-                                        for (size_t k = 0; k < d.values.size(); ++k) {
-                                          joined += (k ? "|" : "") + ElementText(d.values[k]);
-                                        }
-                                        EXPECT_EQ(joined, c.expect.text);
-                                      } else {
-                                        EXPECT_EQ(d.text, c.expect.text);
-                                      }
-                                    }
-                                    ++row;
-                                    return true;
-                                  }),
-            1);
+  auto check_row = [&](const RecordRef&, RecordColumns& columns) {
+    if (row >= cases.size()) return false;
+    SCOPED_TRACE(cases[row].name);
+    for (size_t i = 1; i < table->columns.size(); ++i) {
+      const DecodedColumn d = decoder.Decode(table->columns[i], columns.at(i));
+      if (i == row + 1) {
+        EXPECT_EQ(Render(d), cases[row].expect);
+      } else {
+        EXPECT_EQ(d.kind, Kind::kAbsent) << "column " << i;
+      }
+    }
+    ++row;
+    return true;
+  };
+  ASSERT_EQ(reader->ForEachRecord(*table, check_row), 1);
   EXPECT_EQ(row, cases.size());
 }
 
@@ -233,16 +198,13 @@ TEST_P(ColumnDecoderTest, StoredFormsDecodeToTheirValues) {
 TEST_P(ColumnDecoderTest, DumpCommandPrintsDecodedValues) {
   const std::string tool = std::string(TARNWELL_BINARY_DIR) + "/cli/tarnwell";
   if (!std::filesystem::exists(tool)) GTEST_SKIP() << tool << " not built";
-  const std::string out_path = dir_ + "/dump.json";
+  TempDatabase db(ValuesDatabase(GetParam(), Cases()));
+  const std::string out_path = db.dir() + "/dump.json";
   const std::string cmd =
-      "'" + tool + "' dump '" + path_ + "' Values --json >'" + out_path + "' 2>&1 </dev/null";
+      "'" + tool + "' dump '" + db.path() + "' Values --json >'" + out_path + "' 2>&1 </dev/null";
   ASSERT_EQ(std::system(cmd.c_str()), 0);
-  std::FILE* f = std::fopen(out_path.c_str(), "rb");
-  ASSERT_NE(f, nullptr);
-  std::string json;
-  char buf[4096];
-  for (size_t n; (n = std::fread(buf, 1, sizeof buf, f)) > 0;) json.append(buf, n);
-  std::fclose(f);
+  std::ifstream in(out_path);
+  const std::string json{std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>()};
   for (const std::string& want : {
            "\"AsciiText\":\"" + kAsciiText + "\"",
            "\"UnicodeText\":\"" + kAsciiText + "\"",

@@ -6,18 +6,11 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
-#include <cstdio>
-#include <filesystem>
-#include <map>
-#include <memory>
-#include <ostream>
 #include <string>
+#include <tuple>
 
-#include "base/paths.h"
-#include "engine/catalog.h"
 #include "engine/column_decoder.h"
-#include "engine/edb_class.h"
-#include "testing/ese_writer.h"
+#include "engine/engine_test_support.h"
 #include "testing/forge_long_value.h"
 #include "testing/forge_record.h"
 #include "testing/forge_value.h"
@@ -25,48 +18,9 @@
 namespace tarnwell::engine {
 namespace {
 
-struct Format {
-  const char* name;
-  uint32_t page_size;
-  uint32_t revision;
-};
-
-const Format kFormats[] = {
-    {"4k", 4096, 9},
-    {"8k", 8192, 12},
-    {"32k", 32768, 17},
-};
-
 constexpr uint32_t kIdColumn = 1;
 constexpr uint32_t kDataColumn = 256;
 constexpr uint32_t kNoteColumn = 257;
-
-class TempDatabase {
- public:
-  TempDatabase(const forge::DatabaseLayout& layout, const forge::FileDamage& damage = {}) {
-    EXPECT_TRUE(MakeTempDir("tarnwell-lv", &dir_).ok());
-    path_ = dir_ + "/test.edb";
-    Status s = forge::WriteDatabase(layout, path_, &manifest_, damage);
-    EXPECT_TRUE(s.ok()) << s.ToString();
-  }
-  ~TempDatabase() { std::filesystem::remove_all(dir_); }
-  const std::string& path() const { return path_; }
-  const forge::Manifest& manifest() const { return manifest_; }
-
- private:
-  std::string dir_, path_;
-  forge::Manifest manifest_;
-};
-
-std::unique_ptr<EdbClass> OpenWithCatalog(const std::string& path) {
-  std::unique_ptr<EdbClass> reader;
-  Status s = InspectDatabase(path, &reader);
-  EXPECT_TRUE(s.ok()) << s.ToString();
-  if (!reader) return reader;
-  EXPECT_EQ(reader->CollectTreeRecords(kCatalogRootPage), 1);
-  reader->ParseCatalogRecords();
-  return reader;
-}
 
 // Text-like bytes (ASCII, repetitive enough for Xpress and LZ4), different
 // for every value so that a chunk read from the wrong value shows.
@@ -127,11 +81,7 @@ const LvCase kLvCases[] = {
      false},
 };
 
-struct LvParam {
-  Format format;
-  LvCase lv;
-};
-void PrintTo(const LvParam& p, std::ostream* os) { *os << p.format.name << " " << p.lv.name; }
+void PrintTo(const LvCase& c, std::ostream* os) { *os << c.name; }
 
 // Records (Id, Data -> long value i, Note: a short in-record value) over
 // long values 1..n, with ids spread so that they are not consecutive.
@@ -167,20 +117,20 @@ forge::DatabaseLayout LongValueDatabase(const Format& f, const LvCase& c) {
   return layout;
 }
 
-class LongValueTest : public ::testing::TestWithParam<LvParam> {};
+class LongValueTest : public ::testing::TestWithParam<std::tuple<Format, LvCase>> {};
 
 TEST_P(LongValueTest, ReaderAssemblesEveryValue) {
-  const LvParam& p = GetParam();
-  forge::DatabaseLayout layout = LongValueDatabase(p.format, p.lv);
+  const auto& [format, lv_case] = GetParam();
+  forge::DatabaseLayout layout = LongValueDatabase(format, lv_case);
   TempDatabase db(layout);
   const forge::TableManifest& m = db.manifest().tables[0];
   ASSERT_NE(m.long_value_root_page, 0u);
-  if (p.lv.want_branches) {
+  if (lv_case.want_branches) {
     EXPECT_FALSE(m.long_value_branch_pages.empty());
   }
-  if (p.lv.compression != forge::Compression::kNone) {
+  if (lv_case.compression != forge::Compression::kNone) {
     // All but perhaps a short last chunk of each value shrink.
-    EXPECT_GE(m.compressed_chunks + p.lv.values, m.long_value_chunks);
+    EXPECT_GE(m.compressed_chunks + lv_case.values, m.long_value_chunks);
     EXPECT_GT(m.compressed_chunks, 0u);
   }
 
@@ -193,15 +143,15 @@ TEST_P(LongValueTest, ReaderAssemblesEveryValue) {
 
   // Straight through the long-value reader.
   const forge::TableLayout& t = layout.tables[0];
-  const uint32_t chunk_size = p.lv.chunk_size
-                                  ? p.lv.chunk_size
+  const uint32_t chunk_size = lv_case.chunk_size
+                                  ? lv_case.chunk_size
                                   : forge::DefaultLongValueChunkSize(
-                                        {p.format.page_size, p.format.revision, 0}, p.lv.id_size);
+                                        {format.page_size, format.revision, 0}, lv_case.id_size);
   const LongValueReader lvs = reader->long_values();
   uint64_t compressed = 0;
   for (const forge::LongValueLayout& v : t.long_values) {
     LongValue lv;
-    ASSERT_EQ(lvs.Read(m.long_value_root_page, forge::LongValueId(v.id, p.lv.id_size), &lv), 0)
+    ASSERT_EQ(lvs.Read(m.long_value_root_page, forge::LongValueId(v.id, lv_case.id_size), &lv), 0)
         << "id " << v.id;
     EXPECT_FALSE(lv.truncated) << "id " << v.id;
     EXPECT_EQ(lv.declared_size, v.data.size());
@@ -216,133 +166,106 @@ TEST_P(LongValueTest, ReaderAssemblesEveryValue) {
 
   // An id the tree does not hold.
   LongValue missing;
-  EXPECT_EQ(lvs.Read(m.long_value_root_page, forge::LongValueId(1, p.lv.id_size), &missing), -1);
+  EXPECT_EQ(lvs.Read(m.long_value_root_page, forge::LongValueId(1, lv_case.id_size), &missing), -1);
 
   // Through the records and the column decoder, as a table dump sees them.
   const ColumnDecoder decoder(&lvs, table->long_value->root_page());
   size_t row = 0;
-  EXPECT_EQ(reader->ForEachRecord(
-                *table,
-                [&](const RecordRef&, RecordColumns& columns) {
-                  DecodedColumn d = decoder.Decode(table->columns[1], columns.at(1));
-                  EXPECT_EQ(d.kind, DecodedColumn::Kind::kBinary) << d.text;
-                  EXPECT_TRUE(SameBytes(d.bytes, t.long_values[row].data)) << "row " << row;
-                  DecodedColumn note = decoder.Decode(table->columns[2], columns.at(2));
-                  EXPECT_EQ(note.text, "note " + std::to_string(row + 1));
-                  ++row;
-                  return true;
-                }),
-            1);
+  auto check_row = [&](const RecordRef&, RecordColumns& columns) {
+    DecodedColumn d = decoder.Decode(table->columns[1], columns.at(1));
+    EXPECT_EQ(d.kind, DecodedColumn::Kind::kBinary) << d.text;
+    EXPECT_TRUE(SameBytes(d.bytes, t.long_values[row].data)) << "row " << row;
+    DecodedColumn note = decoder.Decode(table->columns[2], columns.at(2));
+    EXPECT_EQ(note.text, "note " + std::to_string(row + 1));
+    ++row;
+    return true;
+  };
+  EXPECT_EQ(reader->ForEachRecord(*table, check_row), 1);
   EXPECT_EQ(row, t.rows.size());
 }
 
-std::vector<LvParam> AllLvParams() {
-  std::vector<LvParam> out;
-  for (const Format& f : kFormats) {
-    for (const LvCase& c : kLvCases) out.push_back({f, c});
-  }
-  return out;
-}
-
-INSTANTIATE_TEST_SUITE_P(Layouts, LongValueTest, ::testing::ValuesIn(AllLvParams()),
-                         [](const ::testing::TestParamInfo<LvParam>& info) {
-                           return std::string(info.param.format.name) + "_" + info.param.lv.name;
+INSTANTIATE_TEST_SUITE_P(Layouts, LongValueTest,
+                         ::testing::Combine(::testing::ValuesIn(kFormats),
+                                            ::testing::ValuesIn(kLvCases)),
+                         [](const auto& info) {
+                           return std::string(std::get<0>(info.param).name) + "_" +
+                                  std::get<1>(info.param).name;
                          });
 
-// A long value whose tree lost one chunk: the reader says the value is
-// truncated and keeps the bytes before the gap, so a dump shows what is left.
-struct DropCase {
-  const char* name;
-  uint32_t dropped;  // chunk index
-  forge::Compression compression;
-};
-
-const DropCase kDropCases[] = {
-    {"first_chunk", 0, forge::Compression::kNone},
-    {"middle_chunk", 4, forge::Compression::kNone},
-    {"last_chunk", 9, forge::Compression::kNone},
-    {"middle_of_xpress_chunks", 4, forge::Compression::kXpress},
-};
-
-struct DropParam {
-  Format format;
-  DropCase drop;
-};
-void PrintTo(const DropParam& p, std::ostream* os) { *os << p.format.name << " " << p.drop.name; }
-
-class MissingChunkTest : public ::testing::TestWithParam<DropParam> {};
+// A long value whose tree lost one chunk (the first, a middle one, the last,
+// one of Xpress chunks): the reader says the value is truncated and keeps the
+// bytes before the gap, so a dump shows what is left.
+class MissingChunkTest : public ::testing::TestWithParam<Format> {};
 
 TEST_P(MissingChunkTest, ValueIsTruncatedAtTheGap) {
-  const DropParam& p = GetParam();
   constexpr uint32_t kChunk = 800;
   constexpr uint32_t kChunks = 10;
-  LvCase c = {"", 3, kChunk * kChunks, kChunk, 4, p.drop.compression, 0, 0, false};
-  forge::DatabaseLayout layout = LongValueDatabase(p.format, c);
-  // Every value the same length, so every one has exactly kChunks chunks.
-  for (forge::LongValueLayout& v : layout.tables[0].long_values) v.data.resize(kChunk * kChunks);
-  const forge::LongValueLayout& damaged = layout.tables[0].long_values[1];
-  forge::FileDamage damage;
-  damage.dropped_chunks.push_back({"Attachments", damaged.id, p.drop.dropped});
-  TempDatabase db(layout, damage);
-  EXPECT_EQ(db.manifest().tables[0].long_value_chunks, 3 * kChunks - 1);
+  const struct {
+    uint32_t dropped;  // chunk index
+    forge::Compression compression;
+  } kDrops[] = {{0, forge::Compression::kNone},
+                {4, forge::Compression::kNone},
+                {9, forge::Compression::kNone},
+                {4, forge::Compression::kXpress}};
+  for (const auto& drop : kDrops) {
+    SCOPED_TRACE("chunk " + std::to_string(drop.dropped) + " of scheme " +
+                 std::to_string(int(drop.compression)));
+    const LvCase c = {"", 3, kChunk * kChunks, kChunk, 4, drop.compression, 0, 0, false};
+    forge::DatabaseLayout layout = LongValueDatabase(GetParam(), c);
+    // Every value the same length, so every one has exactly kChunks chunks.
+    for (forge::LongValueLayout& v : layout.tables[0].long_values) v.data.resize(kChunk * kChunks);
+    const forge::LongValueLayout& damaged = layout.tables[0].long_values[1];
+    forge::FileDamage damage;
+    damage.dropped_chunks.push_back({"Attachments", damaged.id, drop.dropped});
+    TempDatabase db(layout, damage);
+    EXPECT_EQ(db.manifest().tables[0].long_value_chunks, 3 * kChunks - 1);
 
-  auto reader = OpenWithCatalog(db.path());
-  ASSERT_TRUE(reader);
-  const TableDef* table = reader->FindTable("Attachments");
-  ASSERT_TRUE(table && table->long_value);
-  const LongValueReader lvs = reader->long_values();
-  const uint32_t root = table->long_value->root_page();
+    auto reader = OpenWithCatalog(db.path());
+    ASSERT_TRUE(reader);
+    const TableDef* table = reader->FindTable("Attachments");
+    ASSERT_TRUE(table && table->long_value);
+    const LongValueReader lvs = reader->long_values();
+    const uint32_t root = table->long_value->root_page();
 
-  LongValue lv;
-  ASSERT_EQ(lvs.Read(root, forge::LongValueId(damaged.id), &lv), 0);
-  EXPECT_TRUE(lv.truncated);
-  EXPECT_EQ(lv.declared_size, kChunk * kChunks);
-  EXPECT_EQ(lv.total_size, uint64_t(kChunk) * p.drop.dropped);
-  Bytes got;
-  EXPECT_TRUE(lvs.ReadAll(lv, &got).ok());
-  EXPECT_TRUE(
-      SameBytes(got, Bytes(damaged.data.begin(), damaged.data.begin() + kChunk * p.drop.dropped)));
+    LongValue lv;
+    ASSERT_EQ(lvs.Read(root, forge::LongValueId(damaged.id), &lv), 0);
+    EXPECT_TRUE(lv.truncated);
+    EXPECT_EQ(lv.declared_size, kChunk * kChunks);
+    EXPECT_EQ(lv.total_size, uint64_t(kChunk) * drop.dropped);
+    Bytes got;
+    EXPECT_TRUE(lvs.ReadAll(lv, &got).ok());
+    EXPECT_TRUE(
+        SameBytes(got, Bytes(damaged.data.begin(), damaged.data.begin() + kChunk * drop.dropped)));
 
-  // The neighbours are whole.
-  for (size_t i : {0, 2}) {
-    const forge::LongValueLayout& v = layout.tables[0].long_values[i];
-    LongValue whole;
-    ASSERT_EQ(lvs.Read(root, forge::LongValueId(v.id), &whole), 0);
-    EXPECT_FALSE(whole.truncated);
-    Bytes bytes;
-    EXPECT_TRUE(lvs.ReadAll(whole, &bytes).ok());
-    EXPECT_TRUE(SameBytes(bytes, v.data));
-  }
-
-  // The decoder marks the column damaged and keeps what was assembled.
-  const ColumnDecoder decoder(&lvs, root);
-  size_t row = 0;
-  reader->ForEachRecord(*table, [&](const RecordRef&, RecordColumns& columns) {
-    DecodedColumn d = decoder.Decode(table->columns[1], columns.at(1));
-    if (row == 1) {
-      EXPECT_EQ(d.kind, DecodedColumn::Kind::kDamaged);
-      EXPECT_TRUE(SameBytes(d.bytes, got));
-    } else {
-      EXPECT_EQ(d.kind, DecodedColumn::Kind::kBinary);
+    // The neighbours are whole.
+    for (size_t i : {0, 2}) {
+      const forge::LongValueLayout& v = layout.tables[0].long_values[i];
+      LongValue whole;
+      ASSERT_EQ(lvs.Read(root, forge::LongValueId(v.id), &whole), 0);
+      EXPECT_FALSE(whole.truncated);
+      Bytes bytes;
+      EXPECT_TRUE(lvs.ReadAll(whole, &bytes).ok());
+      EXPECT_TRUE(SameBytes(bytes, v.data));
     }
-    ++row;
-    return true;
-  });
-  EXPECT_EQ(row, 3u);
-}
 
-std::vector<DropParam> AllDropParams() {
-  std::vector<DropParam> out;
-  for (const Format& f : kFormats) {
-    for (const DropCase& d : kDropCases) out.push_back({f, d});
+    // The decoder marks the column damaged and keeps what was assembled.
+    const ColumnDecoder decoder(&lvs, root);
+    size_t row = 0;
+    reader->ForEachRecord(*table, [&](const RecordRef&, RecordColumns& columns) {
+      DecodedColumn d = decoder.Decode(table->columns[1], columns.at(1));
+      EXPECT_EQ(d.kind, row == 1 ? DecodedColumn::Kind::kDamaged : DecodedColumn::Kind::kBinary);
+      if (row == 1) {
+        EXPECT_TRUE(SameBytes(d.bytes, got));
+      }
+      ++row;
+      return true;
+    });
+    EXPECT_EQ(row, 3u);
   }
-  return out;
 }
 
-INSTANTIATE_TEST_SUITE_P(Damage, MissingChunkTest, ::testing::ValuesIn(AllDropParams()),
-                         [](const ::testing::TestParamInfo<DropParam>& info) {
-                           return std::string(info.param.format.name) + "_" + info.param.drop.name;
-                         });
+INSTANTIATE_TEST_SUITE_P(Damage, MissingChunkTest, ::testing::ValuesIn(kFormats),
+                         [](const auto& info) { return std::string(info.param.name); });
 
 }  // namespace
 }  // namespace tarnwell::engine

@@ -128,16 +128,10 @@ INSTANTIATE_TEST_SUITE_P(Families, PageFamilyTest,
                                            std::make_pair(PageFamily::kLarge, size_t(32768))));
 
 TEST(LargePageTest, NodeFlagsComeFromTheNodeAndAreCleared) {
-  // A node whose first byte pair is 0x00 0xE0 (u16 0xE000): flags 7 and a
-  // cleared first u16 in the copy handed out.
-  Bytes raw(32768, 0);
-  StoreU16LE(raw.data() + kPageTagCountOffset, 2);
-  StoreU32LE(raw.data() + kPageFlagsOffset, kPageFlagLeaf);
-  const Bytes node = {0x00, 0xE0, 0x33};
-  std::copy(node.begin(), node.end(), raw.begin() + kLargePageHeaderSize + 4);
-  StoreU16LE(raw.data() + 32768 - 8, 3);
-  StoreU16LE(raw.data() + 32768 - 6, 4);
-  Page page(raw, PageFamily::kLarge);
+  // The node's first u16 reads 0xE000: flags 7, cleared in the copy handed out.
+  const Page page(MakePage(PageFamily::kLarge, 32768, kPageFlagLeaf,
+                           {{Bytes{0, 0, 0, 0}, 0}, {Bytes{0x00, 0x00, 0x33}, 7}}),
+                  PageFamily::kLarge);
   ASSERT_EQ(page.nodes().size(), 2u);
   EXPECT_EQ(page.nodes()[1].flags, 7);
   EXPECT_EQ(page.nodes()[1].bytes.ToBytes(), (Bytes{0x00, 0x00, 0x33}));

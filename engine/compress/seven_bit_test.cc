@@ -5,16 +5,10 @@
 #include <ostream>
 #include <string>
 
+#include "engine/compress/compress_test_support.h"
+
 namespace tarnwell::engine {
 namespace {
-
-Bytes FromHex(const std::string& hex) {
-  Bytes out;
-  for (size_t i = 0; i + 1 < hex.size(); i += 2) {
-    out.push_back(static_cast<uint8_t>(std::stoi(hex.substr(i, 2), nullptr, 16)));
-  }
-  return out;
-}
 
 Bytes Utf16(const std::string& ascii) {
   Bytes out;

@@ -2,92 +2,70 @@
 
 #include <gtest/gtest.h>
 
-#include <cstdio>
 #include <ostream>
 #include <string>
 #include <vector>
 
+#include "engine/compress/compress_test_support.h"
+
 namespace tarnwell::engine {
 namespace {
 
-Bytes FromHex(const std::string& hex) {
-  Bytes out;
-  for (size_t i = 0; i + 1 < hex.size();) {
-    if (hex[i] == ' ') {
-      ++i;
-      continue;
-    }
-    out.push_back(static_cast<uint8_t>(std::stoi(hex.substr(i, 2), nullptr, 16)));
-    i += 2;
-  }
+struct GoodCase {
+  std::string name;
+  std::string stream;
+  std::string text;
+};
+
+void PrintTo(const GoodCase& c, std::ostream* os) { *os << c.name; }
+
+std::string Repeat(const std::string& s, size_t times) {
+  std::string out;
+  while (times-- > 0) out += s;
   return out;
 }
 
-std::string Decode(const Bytes& stream, size_t cap, XpressCode expect = XpressCode::kOk) {
-  std::string out(cap, '\0');
+std::vector<GoodCase> GoodCases() {
+  return {
+      // The two worked examples Microsoft publishes for Plain LZ77.
+      {"published_literals", "3f000000 6162636465666768696a6b6c6d6e6f707172737475767778797a",
+       "abcdefghijklmnopqrstuvwxyz"},
+      {"published_match", "ffffff1f 616263 1700 0f ff 2601", Repeat("abc", 100)},
+      // 32 literals fill the first flag word; the second holds the end marker.
+      {"second_flag_word",
+       "00000000 4142434445464748494a4b4c4d4e4f505152535455565758595a5b5c5d5e5f60 ffffffff",
+       "ABCDEFGHIJKLMNOPQRSTUVWXYZ[\\]^_`"},
+      // Every length form, built by hand: one literal 'a' then matches at distance 1.
+      {"short_code", "ffffff7f 61 0600", std::string(1 + 9, 'a')},
+      {"nibble", "ffffff7f 61 0700 00", std::string(1 + 10, 'a')},
+      {"nibble_max", "ffffff7f 61 0700 0e", std::string(1 + 24, 'a')},
+      {"extra8", "ffffff7f 61 0700 0f 00", std::string(1 + 25, 'a')},
+      {"extra8_max", "ffffff7f 61 0700 0f fe", std::string(1 + 279, 'a')},
+      {"extra16", "ffffff7f 61 0700 0f ff 1501", std::string(1 + 280, 'a')},
+      {"extra16_max", "ffffff7f 61 0700 0f ff ffff", std::string(1 + 65538, 'a')},
+      {"extra32", "ffffff7f 61 0700 0f ff 0000 00000100", std::string(1 + 65539, 'a')},
+      // Two long matches share one length byte: low half first, then high half.
+      {"shared_nibble", "ffffff7f 61 0700 f0 0700 00", std::string(1 + 10 + 25, 'a')},
+      // A third long match opens a fresh shared byte.
+      {"shared_nibble_reopen", "ffffff7f 61 0700 21 0700 0700 03",
+       std::string(1 + 11 + 12 + 13, 'a')},
+  };
+}
+
+class XpressGoodTest : public ::testing::TestWithParam<GoodCase> {};
+
+TEST_P(XpressGoodTest, Decodes) {
+  const GoodCase& c = GetParam();
+  std::string out(c.text.size() + 8, '\0');
   const XpressResult r =
-      DecodePlainLz77(stream, reinterpret_cast<uint8_t*>(out.data()), out.size());
-  EXPECT_EQ(r.code, expect);
+      DecodePlainLz77(FromHex(c.stream), reinterpret_cast<uint8_t*>(out.data()), out.size());
+  EXPECT_EQ(r.code, XpressCode::kOk);
   out.resize(r.written);
-  return out;
+  EXPECT_EQ(out, c.text);
 }
 
-// The two worked examples Microsoft publishes for Plain LZ77.
-TEST(XpressDecoderTest, PublishedExamples) {
-  EXPECT_EQ(Decode(FromHex("3f000000 6162636465666768696a6b6c6d6e6f707172737475767778797a"), 64),
-            "abcdefghijklmnopqrstuvwxyz");
-  std::string abc;
-  for (int i = 0; i < 100; ++i) abc += "abc";
-  EXPECT_EQ(Decode(FromHex("ffffff1f 616263 1700 0f ff 2601"), 300), abc);
-}
-
-struct RunCase {
-  const char* name;
-  const char* stream;
-  size_t run;  // the stream decodes to this many 'a'
-};
-
-void PrintTo(const RunCase& c, std::ostream* os) { *os << c.name; }
-
-// Every length form, built by hand: one literal 'a' then matches at distance 1.
-const RunCase kRunCases[] = {
-    {"short_code", "ffffff7f 61 0600", 1 + 9},
-    {"nibble", "ffffff7f 61 0700 00", 1 + 10},
-    {"nibble_max", "ffffff7f 61 0700 0e", 1 + 24},
-    {"extra8", "ffffff7f 61 0700 0f 00", 1 + 25},
-    {"extra8_max", "ffffff7f 61 0700 0f fe", 1 + 279},
-    {"extra16", "ffffff7f 61 0700 0f ff 1501", 1 + 280},
-    {"extra16_max", "ffffff7f 61 0700 0f ff ffff", 1 + 65538},
-    {"extra32", "ffffff7f 61 0700 0f ff 0000 00000100", 1 + 65539},
-    // Two long matches share one length byte: low half first, then high half.
-    {"shared_nibble", "ffffff7f 61 0700 f0 0700 00", 1 + 10 + 25},
-    // A third long match opens a fresh shared byte.
-    {"shared_nibble_reopen", "ffffff7f 61 0700 21 0700 0700 03", 1 + 11 + 12 + 13},
-};
-
-class XpressRunTest : public ::testing::TestWithParam<RunCase> {};
-
-TEST_P(XpressRunTest, DecodesRun) {
-  const RunCase& c = GetParam();
-  EXPECT_EQ(Decode(FromHex(c.stream), c.run + 8), std::string(c.run, 'a'));
-}
-
-INSTANTIATE_TEST_SUITE_P(LengthForms, XpressRunTest, ::testing::ValuesIn(kRunCases),
-                         [](const auto& info) { return std::string(info.param.name); });
-
-TEST(XpressDecoderTest, FlagWordsAfterThirtyTwoItems) {
-  // 32 literals fill the first flag word; the second word holds the end marker.
-  std::string hex = "00000000";
-  std::string expected;
-  for (int i = 0; i < 32; ++i) {
-    char buf[3];
-    snprintf(buf, sizeof buf, "%02x", 'A' + i);
-    hex += buf;
-    expected += static_cast<char>('A' + i);
-  }
-  hex += "ffffffff";
-  EXPECT_EQ(Decode(FromHex(hex), 64), expected);
-}
+INSTANTIATE_TEST_SUITE_P(Streams, XpressGoodTest, ::testing::ValuesIn(GoodCases()),
+                         [](const auto& info) { return info.param.name; });
 
 struct BadCase {
   const char* name;

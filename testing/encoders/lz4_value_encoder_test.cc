@@ -4,6 +4,7 @@
 
 #include <string>
 
+#include "engine/compress/compress_test_support.h"
 #include "engine/compress/compressed_value.h"
 
 namespace tarnwell::forge {
@@ -14,13 +15,9 @@ using engine::DecodedValue;
 using engine::DecodeStatus;
 
 Bytes Sample(size_t n, bool repetitive) {
+  if (!repetitive) return engine::Noise(n, 12345);
   Bytes out(n);
-  uint32_t seed = 12345;
-  for (size_t i = 0; i < n; ++i) {
-    seed = seed * 1664525u + 1013904223u;
-    out[i] =
-        repetitive ? static_cast<uint8_t>("mailbox "[i % 8]) : static_cast<uint8_t>(seed >> 24);
-  }
+  for (size_t i = 0; i < n; ++i) out[i] = static_cast<uint8_t>("mailbox "[i % 8]);
   return out;
 }
 

@@ -6,6 +6,7 @@
 #include <string>
 #include <vector>
 
+#include "engine/compress/compress_test_support.h"
 #include "engine/compress/compressed_value.h"
 #include "engine/compress/decompress_value.h"
 #include "engine/compress/xpress_decoder.h"
@@ -14,33 +15,12 @@ namespace tarnwell::forge {
 namespace {
 
 using engine::DecodePlainLz77;
+using engine::FromHex;
+using engine::Noise;
 using engine::XpressCode;
 using engine::XpressResult;
 
 Bytes FromString(const std::string& s) { return Bytes(s.begin(), s.end()); }
-
-Bytes FromHex(const std::string& hex) {
-  Bytes out;
-  for (size_t i = 0; i + 1 < hex.size();) {
-    if (hex[i] == ' ') {
-      ++i;
-      continue;
-    }
-    out.push_back(static_cast<uint8_t>(std::stoi(hex.substr(i, 2), nullptr, 16)));
-    i += 2;
-  }
-  return out;
-}
-
-// Deterministic noise: a fixed linear congruential sequence.
-Bytes Noise(size_t n, uint32_t seed) {
-  Bytes out(n);
-  for (auto& b : out) {
-    seed = seed * 1664525u + 1013904223u;
-    b = static_cast<uint8_t>(seed >> 24);
-  }
-  return out;
-}
 
 Bytes Repeat(size_t n, uint8_t b = 'a') { return Bytes(n, b); }
 
