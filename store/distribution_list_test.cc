@@ -3,16 +3,14 @@
 #include <gtest/gtest.h>
 
 #include "base/text.h"
+#include "store/store_test_support.h"
 
 namespace tarnwell::store {
 namespace {
 
-void AppendU16String(std::string_view utf8, Bytes* out) {
-  const Bytes text = Utf8ToUtf16LE(utf8);
-  out->insert(out->end(), text.begin(), text.end());
-  out->push_back(0);
-  out->push_back(0);
-}
+using test_support::Append;
+using test_support::Cat;
+using test_support::Wide;
 
 // A member column: offset field, `gap` filler bytes, then the members.
 Bytes MemberValue(const std::vector<ListMember>& members, size_t gap = 0) {
@@ -20,9 +18,7 @@ Bytes MemberValue(const std::vector<ListMember>& members, size_t gap = 0) {
   StoreU32LE(out.data(), uint32_t(kMemberListOffsetSize + gap));
   for (const ListMember& m : members) {
     out.insert(out.end(), kMemberHeaderSize, 0x5A);
-    AppendU16String(m.display_name, &out);
-    AppendU16String(m.address_type, &out);
-    AppendU16String(m.email_address, &out);
+    Append(&out, Cat({Wide(m.display_name), Wide(m.address_type), Wide(m.email_address)}));
   }
   return out;
 }

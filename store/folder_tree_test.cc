@@ -41,8 +41,9 @@ class RecordingSink : public FolderTreeSink {
   std::map<int64_t, int> depth_;
 };
 
-TEST(FolderTreeTest, StartsWithTheTwoFixedEntries) {
+TEST(FolderTreeTest, LinksChildrenInReverseAndDropsWhatHasNoParent) {
   FolderList list;
+  // Every list starts with the orphan entry and ROOT, its own parent.
   ASSERT_EQ(list.size(), 2u);
   EXPECT_EQ(list[0].display_name, "Orphan Entry");
   EXPECT_EQ(list[0].folder_id, 0u);
@@ -50,10 +51,6 @@ TEST(FolderTreeTest, StartsWithTheTwoFixedEntries) {
   EXPECT_EQ(list[1].folder_id, 1u);
   EXPECT_EQ(list[1].parent_id, 1u);
   EXPECT_TRUE(list.only_fixed_entries());
-}
-
-TEST(FolderTreeTest, LinksChildrenInReverseAndDropsWhatHasNoParent) {
-  FolderList list;
   list.Append(Node("Mailbox A", 100, 1));
   list.Append(Node("A", 200, 100));
   list.Append(Node("B", 201, 100));
@@ -111,18 +108,10 @@ TEST(KeyOrdinalMapTest, RepeatedKeysGetNoOrdinalAndOrdinalsStayDense) {
   std::vector<uint64_t> dropped = map.Finish();
   EXPECT_EQ(dropped, (std::vector<uint64_t>{3, 5}));
   ASSERT_EQ(map.size(), 4u);
-  EXPECT_EQ(map.Find(50), 1u);
-  EXPECT_EQ(map.Find(10), 2u);
-  EXPECT_EQ(map.Find(30), 3u);
-  EXPECT_EQ(map.Find(20), 4u);
+  const std::vector<uint64_t> by_ordinal = {50, 10, 30, 20};
+  EXPECT_EQ(map.KeysByOrdinal(), by_ordinal);
+  for (uint64_t k = 0; k < by_ordinal.size(); ++k) EXPECT_EQ(map.Find(by_ordinal[k]), k + 1);
   EXPECT_FALSE(map.Find(99));
-  EXPECT_EQ(map.KeysByOrdinal(), (std::vector<uint64_t>{50, 10, 30, 20}));
-}
-
-TEST(MessageFlagsTest, BitsInOrderEachWithAComma) {
-  EXPECT_EQ(MessageFlagsText(0x213), "Read,Unmodified,Attachment,NRN pending,");
-  EXPECT_EQ(MessageFlagsText(0), "");
-  EXPECT_EQ(MessageFlagsText(0x400), "");
 }
 
 }  // namespace

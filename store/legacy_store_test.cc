@@ -6,18 +6,16 @@
 
 #include <gtest/gtest.h>
 
-#include <filesystem>
-#include <map>
-
-#include "base/date_time.h"
-#include "base/paths.h"
-#include "engine/catalog.h"
+#include "store/store_test_support.h"
 #include "testing/exchange/store_builder.h"
 
 namespace tarnwell::store {
 namespace {
 
 namespace fx = forge::exchange;
+using test_support::ListTime;
+using test_support::OpenedStore;
+using Shown = test_support::TreeRecorder::Shown;
 
 struct Case {
   const char* name;
@@ -39,100 +37,73 @@ const Case kCases[] = {
     {"v2007_public_standard", 2, true, false, ScanMode::kStandard, 0},
 };
 
-class Tree : public FolderTreeSink {
- public:
-  int64_t AddTopItem(const std::string& text, int, uint64_t) override {
-    paths[0] = {};
-    top = text;
-    return 0;
-  }
-  int64_t AddFolder(int64_t parent, const std::string& text, int icon, uint32_t index) override {
-    std::vector<std::string> path = paths[parent];
-    path.push_back(text);
-    const int64_t handle = int64_t(shown.size()) + 1;
-    paths[handle] = path;
-    shown.push_back({path, icon, index});
-    return handle;
-  }
-  struct Shown {
-    std::vector<std::string> path;
-    int icon;
-    uint32_t index;
-  };
-  std::string top;
-  std::vector<Shown> shown;
-  std::map<int64_t, std::vector<std::string>> paths;
-};
-
-std::string Time(uint64_t filetime) { return filetime ? DateText(filetime) : ""; }
-
-class LegacyStoreTest : public ::testing::TestWithParam<Case> {
- protected:
-  void SetUp() override {
-    const Case& c = GetParam();
-    ASSERT_TRUE(MakeTempDir("tarnwell-store", &dir_).ok());
-    fx::LegacyStoreOptions options;
-    options.version = c.version;
-    options.public_store = c.public_store;
-    if (c.damaged) options.damage = fx::DamageOptions::All();
-    options.max_rows_per_leaf = c.rows_per_leaf;
-    path_ = dir_ + "/store.edb";
-    Status s = fx::BuildLegacyStore(options, path_, &manifest_);
-    ASSERT_TRUE(s.ok()) << s.ToString();
-
-    reader_ = engine::MakeReader(c.version);
-    ASSERT_TRUE(reader_->OpenDatabase(path_, {}, c.version));
-    if (c.mode == ScanMode::kStandard) {
-      ASSERT_EQ(reader_->CollectTreeRecords(engine::kCatalogRootPage), 1);
-    } else {
-      ASSERT_TRUE(reader_->ScanLeafPages());
-      ASSERT_EQ(reader_->CollectLeafPageRecords(), 1);
+// The parts of an opened item that only a detail decode fills.
+void ExpectDetail(const fx::ManifestItem& want, DecodePurpose purpose, const ItemRecords& item) {
+  EXPECT_EQ(purpose, PurposeForClass(want.message_class));
+  if (purpose == DecodePurpose::kMessageDetail) {
+    const MessageRecord& m = item.message;
+    if (!want.body_html.empty()) {
+      EXPECT_EQ(ByteView(m.body).ToString(), want.body_html);
+    } else if (!want.body_text.empty()) {
+      EXPECT_EQ(ByteView(m.body).ToString(), want.body_text);
+      EXPECT_TRUE(m.body_is_text);
     }
-    ASSERT_EQ(reader_->ParseCatalogRecords(), 1);
-    reader_->GetTableNames();
-    store_ = std::make_unique<LegacyStore>(*reader_, c.version, c.mode);
-    store_->SetWorkFolder(dir_);
-    store_->WalkMailboxes();
-    store_->WalkFolders();
-    store_->LinkTree(NullProgress());
-    ASSERT_TRUE(ShowTree(store_->folders(), store_->public_store(), path_, 1, tree_));
-    ASSERT_TRUE(store_->BuildMessageMap());
-    ASSERT_TRUE(store_->BuildAttachmentMap());
-  }
-  void TearDown() override {
-    store_.reset();
-    reader_.reset();
-    if (!dir_.empty()) std::filesystem::remove_all(dir_);
-  }
-
-  const Tree::Shown* Find(const std::vector<std::string>& path) const {
-    for (const auto& s : tree_.shown) {
-      if (s.path == path) return &s;
+    if (!want.rtf_text.empty()) {
+      ASSERT_TRUE(m.rtf_body);
+      EXPECT_EQ(ByteView(*m.rtf_body).ToString().substr(0, want.rtf_text.size()), want.rtf_text);
     }
-    return nullptr;
+    ASSERT_EQ(m.members.size(), want.members.size());
+    for (size_t k = 0; k < m.members.size(); ++k) {
+      EXPECT_EQ(m.members[k].display_name, want.members[k].name);
+      EXPECT_EQ(m.members[k].email_address, want.members[k].address);
+    }
+  } else if (purpose == DecodePurpose::kContactDetail) {
+    for (const auto& [name, value] : want.strings) {
+      auto it = item.contact.strings.find(name);
+      if (it != item.contact.strings.end()) {
+        EXPECT_EQ(it->second, value) << name;
+      }
+    }
+  } else if (purpose == DecodePurpose::kAppointmentDetail) {
+    for (const char* column : {"T814e", "T8197", "T60", "T81ef"}) {
+      auto it = want.times.find(column);
+      if (it != want.times.end()) {
+        EXPECT_EQ(item.appointment.start_time, it->second) << column;
+        break;
+      }
+    }
   }
+}
 
-  std::string dir_, path_;
-  fx::StoreManifest manifest_;
-  std::unique_ptr<engine::EdbClass> reader_;
-  std::unique_ptr<LegacyStore> store_;
-  Tree tree_;
-};
+class LegacyStoreTest : public ::testing::TestWithParam<Case> {};
 
-TEST_P(LegacyStoreTest, TreeMatchesTheManifest) {
-  EXPECT_EQ(store_->public_store(), manifest_.public_store);
-  if (manifest_.public_store) {
-    EXPECT_EQ(tree_.top, "Public Root");
+TEST_P(LegacyStoreTest, TreeListsItemsAndMapsMatchTheManifest) {
+  const Case& c = GetParam();
+  OpenedStore<LegacyStore> s("tarnwell-store");
+  fx::LegacyStoreOptions options;
+  options.version = c.version;
+  options.public_store = c.public_store;
+  if (c.damaged) options.damage = fx::DamageOptions::All();
+  options.max_rows_per_leaf = c.rows_per_leaf;
+  const Status built = fx::BuildLegacyStore(options, s.path(), &s.manifest);
+  ASSERT_TRUE(built.ok()) << built.ToString();
+  ASSERT_TRUE(s.Open(c.version, c.mode));
+  LegacyStore& store = *s.store;
+  const fx::StoreManifest& manifest = s.manifest;
+
+  EXPECT_EQ(store.public_store(), manifest.public_store);
+  if (manifest.public_store) {
+    EXPECT_EQ(s.tree.top, "Public Root");
   }
-  size_t visible = 0;
-  for (const fx::ManifestFolder& f : manifest_.folders) {
+  size_t visible = 0, items_checked = 0;
+  for (const fx::ManifestFolder& f : manifest.folders) {
     std::vector<std::string> path = f.path;
     // The public store's top item is "Public Root" itself.
-    if (manifest_.public_store && !path.empty() && path.front() == "Public Root") {
+    if (manifest.public_store && !path.empty() && path.front() == "Public Root") {
       path.erase(path.begin());
       if (path.empty()) continue;
     }
-    const Tree::Shown* shown = Find(path);
+    const Shown* shown = s.tree.Find(path);
     if (!f.visible) {
       EXPECT_EQ(shown, nullptr) << f.name << " (" << f.damage << ") must not be shown";
       continue;
@@ -140,22 +111,7 @@ TEST_P(LegacyStoreTest, TreeMatchesTheManifest) {
     ++visible;
     ASSERT_NE(shown, nullptr) << "folder not shown: " << f.name;
     EXPECT_EQ(shown->icon, f.icon) << f.name;
-  }
-  // Mailboxes are shown too.
-  EXPECT_EQ(tree_.shown.size(), visible + manifest_.mailboxes.size());
-}
-
-TEST_P(LegacyStoreTest, ListsAndItemsMatchTheManifest) {
-  const int version = GetParam().version;
-  size_t items_checked = 0;
-  for (const fx::ManifestFolder& f : manifest_.folders) {
-    if (!f.visible) continue;
-    std::vector<std::string> path = f.path;
-    if (manifest_.public_store && path.front() == "Public Root") path.erase(path.begin());
-    if (path.empty()) continue;  // the public store's top item
-    const Tree::Shown* shown = Find(path);
-    ASSERT_NE(shown, nullptr);
-    std::vector<MessageSummary> rows = store_->ListFolder(shown->index);
+    std::vector<MessageSummary> rows = store.ListFolder(shown->ref.folder);
     ASSERT_EQ(rows.size(), f.item_count) << f.name;
     for (size_t i = 0; i < f.items.size() && i < rows.size(); ++i) {
       const fx::ManifestItem& want = f.items[i];
@@ -166,78 +122,38 @@ TEST_P(LegacyStoreTest, ListsAndItemsMatchTheManifest) {
       EXPECT_EQ(got.sender, want.sender_shown);
       EXPECT_EQ(got.to, want.to_shown);
       EXPECT_EQ(got.message_class, want.message_class);
-      EXPECT_EQ(got.created, Time(want.created));
-      EXPECT_EQ(got.modified, Time(want.modified));
-      EXPECT_EQ(got.received, Time(want.received));
+      EXPECT_EQ(got.created, ListTime(want.created));
+      EXPECT_EQ(got.modified, ListTime(want.modified));
+      EXPECT_EQ(got.received, ListTime(want.received));
       EXPECT_EQ(got.flags_text, MessageFlagsText(want.flags));
       EXPECT_EQ(got.importance, want.importance);
 
       DecodePurpose purpose;
-      std::optional<ItemRecords> item = store_->OpenMessage(got.message_key, &purpose);
+      std::optional<ItemRecords> item = store.OpenMessage(got.message_key, &purpose);
       if (!want.in_msg_table) {
         EXPECT_FALSE(item) << "a list row without a message record opened";
         continue;
       }
       ASSERT_TRUE(item);
       ++items_checked;
-      EXPECT_EQ(purpose, PurposeForClass(want.message_class));
-      if (purpose == DecodePurpose::kMessageDetail) {
-        const MessageRecord& m = item->message;
-        if (!want.body_html.empty()) {
-          EXPECT_EQ(ByteView(m.body).ToString(), want.body_html);
-        } else if (!want.body_text.empty()) {
-          EXPECT_EQ(ByteView(m.body).ToString(), want.body_text);
-          EXPECT_TRUE(m.body_is_text);
-        }
-        if (!want.rtf_text.empty()) {
-          ASSERT_TRUE(m.rtf_body);
-          EXPECT_EQ(ByteView(*m.rtf_body).ToString().substr(0, want.rtf_text.size()),
-                    want.rtf_text);
-        }
-        ASSERT_EQ(m.members.size(), want.members.size());
-        for (size_t k = 0; k < m.members.size(); ++k) {
-          EXPECT_EQ(m.members[k].display_name, want.members[k].name);
-          EXPECT_EQ(m.members[k].email_address, want.members[k].address);
-        }
-      } else if (purpose == DecodePurpose::kContactDetail) {
-        for (const auto& [name, value] : want.strings) {
-          auto it = item->contact.strings.find(name);
-          if (it != item->contact.strings.end()) {
-            EXPECT_EQ(it->second, value) << name;
-          }
-        }
-      } else if (purpose == DecodePurpose::kAppointmentDetail) {
-        for (const char* column : {"T814e", "T8197", "T60", "T81ef"}) {
-          auto it = want.times.find(column);
-          if (it != want.times.end()) {
-            EXPECT_EQ(item->appointment.start_time, it->second) << column;
-            break;
-          }
-        }
-      }
-      std::vector<AttachmentRecord> attachments = store_->ListAttachments(got.message_key);
-      ASSERT_EQ(attachments.size(), want.attachments.size());
-      for (size_t k = 0; k < attachments.size(); ++k) {
-        EXPECT_EQ(attachments[k].name, want.attachments[k].name);
-        EXPECT_EQ(fx::Sha256Hex(ByteView(attachments[k].data)), want.attachments[k].sha256)
-            << attachments[k].name;
-      }
+      ExpectDetail(want, purpose, *item);
+      test_support::ExpectAttachments(store.ListAttachments(got.message_key), want.attachments);
     }
   }
   EXPECT_GT(items_checked, 0u);
-  (void)version;
-}
+  // Mailboxes are shown too.
+  EXPECT_EQ(s.tree.shown.size(), visible + manifest.mailboxes.size());
 
-TEST_P(LegacyStoreTest, MapsHoldEveryKeyOnce) {
-  if (GetParam().mode == ScanMode::kStandard) {
-    EXPECT_EQ(store_->message_map().size(), 0u);
+  // The maps hold every key once; Standard Mode searches by key instead.
+  if (c.mode == ScanMode::kStandard) {
+    EXPECT_EQ(store.message_map().size(), 0u);
     return;
   }
-  EXPECT_EQ(store_->message_map().size(), manifest_.messages);
+  EXPECT_EQ(store.message_map().size(), manifest.messages);
   // The location file is dense: ordinal k at (k - 1) * 6.
-  const auto size = std::filesystem::file_size(dir_ + "/" + kMessageLocationFile);
-  EXPECT_EQ(size, manifest_.messages * kRecordLocationSize);
-  EXPECT_EQ(store_->attachment_map().size(), manifest_.attachment_rows);
+  EXPECT_EQ(std::filesystem::file_size(s.dir + "/" + kMessageLocationFile),
+            manifest.messages * kRecordLocationSize);
+  EXPECT_EQ(store.attachment_map().size(), manifest.attachment_rows);
 }
 
 INSTANTIATE_TEST_SUITE_P(Builder, LegacyStoreTest, ::testing::ValuesIn(kCases),

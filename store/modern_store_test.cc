@@ -4,18 +4,16 @@
 
 #include <gtest/gtest.h>
 
-#include <filesystem>
-#include <map>
-
-#include "base/date_time.h"
-#include "base/paths.h"
-#include "engine/catalog.h"
+#include "store/store_test_support.h"
 #include "testing/exchange/modern_store_builder.h"
 
 namespace tarnwell::store {
 namespace {
 
 namespace fx = forge::exchange;
+using test_support::ListTime;
+using test_support::OpenedStore;
+using Shown = test_support::TreeRecorder::Shown;
 
 struct Case {
   const char* name;
@@ -35,107 +33,37 @@ const Case kCases[] = {
     {"real_layout_advance", 5, true, false, ScanMode::kAdvance, true},
 };
 
-class Tree : public FolderTreeSink {
- public:
-  int64_t AddTopItem(const std::string&, int, uint64_t) override {
-    paths[0] = {};
-    return 0;
-  }
-  int64_t AddFolder(int64_t parent, const std::string& text, int icon, uint32_t index) override {
-    return Add(parent, text, icon, {-1, index});
-  }
-  int64_t AddMailboxFolder(int64_t parent, const std::string& text, int icon, int32_t mailbox,
-                           uint32_t index) override {
-    return Add(parent, text, icon, {mailbox, index});
-  }
-  int64_t Add(int64_t parent, const std::string& text, int icon, FolderRef ref) {
-    std::vector<std::string> path = paths[parent];
-    path.push_back(text);
-    const int64_t handle = int64_t(shown.size()) + 1;
-    paths[handle] = path;
-    shown.push_back({path, icon, ref});
-    return handle;
-  }
-  struct Shown {
-    std::vector<std::string> path;
-    int icon;
-    FolderRef ref;
-  };
-  std::vector<Shown> shown;
-  std::map<int64_t, std::vector<std::string>> paths;
-};
-
-std::string Time(uint64_t filetime) { return filetime ? DateText(filetime) : ""; }
-
-class ModernStoreTest : public ::testing::TestWithParam<Case> {
- protected:
-  void SetUp() override {
-    const Case& c = GetParam();
-    ASSERT_TRUE(MakeTempDir("tarnwell-modern", &dir_).ok());
-    fx::ModernStoreOptions options;
-    options.version = c.version;
-    options.later_2013_variant = c.later_variant;
-    options.real_layout = c.real_layout;
-    if (c.damaged) options.damage = fx::ModernDamageOptions::All();
-    const std::string path = dir_ + "/store.edb";
-    Status s = fx::BuildModernStore(options, path, &manifest_);
-    ASSERT_TRUE(s.ok()) << s.ToString();
-    reader_ = engine::MakeReader(c.version);
-    ASSERT_TRUE(reader_->OpenDatabase(path, {}, c.version));
-    if (c.mode == ScanMode::kStandard) {
-      ASSERT_EQ(reader_->CollectTreeRecords(engine::kCatalogRootPage), 1);
-    } else {
-      ASSERT_TRUE(reader_->ScanLeafPages());
-      ASSERT_EQ(reader_->CollectLeafPageRecords(), 1);
-    }
-    ASSERT_EQ(reader_->ParseCatalogRecords(), 1);
-    reader_->GetTableNames();
-    store_ = std::make_unique<ModernStore>(*reader_, c.version, c.mode);
-    store_->SetWorkFolder(dir_);
-    ASSERT_TRUE(store_->WalkMailboxes());
-    ASSERT_TRUE(store_->WalkFolders());
-    store_->LinkTree(NullProgress());
-    ASSERT_TRUE(store_->ShowTree(path, 1, tree_));
-  }
-  void TearDown() override {
-    store_.reset();
-    reader_.reset();
-    if (!dir_.empty()) std::filesystem::remove_all(dir_);
-  }
-  const Tree::Shown* Find(const std::vector<std::string>& path) const {
-    for (const auto& s : tree_.shown) {
-      if (s.path == path) return &s;
-    }
-    return nullptr;
-  }
-
-  std::string dir_;
-  fx::StoreManifest manifest_;
-  std::unique_ptr<engine::EdbClass> reader_;
-  std::unique_ptr<ModernStore> store_;
-  Tree tree_;
-};
-
-TEST_P(ModernStoreTest, MailboxesNameTheirTables) {
-  EXPECT_EQ(reader_->extended_catalog(), GetParam().later_variant);
-  for (const fx::ManifestMailbox& m : manifest_.mailboxes) {
-    EXPECT_EQ(ModernFolderTableName(GetParam().version, m.number), m.folder_table) << m.name;
-    const Tree::Shown* shown = Find({m.name});
-    ASSERT_NE(shown, nullptr) << m.name;
-  }
-}
+class ModernStoreTest : public ::testing::TestWithParam<Case> {};
 
 TEST_P(ModernStoreTest, TreeListsAndItemsMatchTheManifest) {
+  const Case& c = GetParam();
+  OpenedStore<ModernStore> s("tarnwell-modern");
+  fx::ModernStoreOptions options;
+  options.version = c.version;
+  options.later_2013_variant = c.later_variant;
+  options.real_layout = c.real_layout;
+  if (c.damaged) options.damage = fx::ModernDamageOptions::All();
+  const Status built = fx::BuildModernStore(options, s.path(), &s.manifest);
+  ASSERT_TRUE(built.ok()) << built.ToString();
+  ASSERT_TRUE(s.Open(c.version, c.mode));
+  EXPECT_TRUE(s.walked_mailboxes && s.walked_folders);
+  ModernStore& store = *s.store;
+
+  EXPECT_EQ(s.reader->extended_catalog(), c.later_variant);
+  for (const fx::ManifestMailbox& m : s.manifest.mailboxes) {
+    EXPECT_EQ(ModernFolderTableName(c.version, m.number), m.folder_table) << m.name;
+    EXPECT_NE(s.tree.Find({m.name}), nullptr) << m.name;
+  }
   size_t items_checked = 0;
-  for (const fx::ManifestFolder& f : manifest_.folders) {
-    const Tree::Shown* shown = Find(f.path);
+  for (const fx::ManifestFolder& f : s.manifest.folders) {
+    const Shown* shown = s.tree.Find(f.path);
     if (!f.visible) {
       EXPECT_EQ(shown, nullptr) << f.name;
       continue;
     }
     ASSERT_NE(shown, nullptr) << "folder not shown: " << f.name;
     EXPECT_EQ(shown->icon, f.icon) << f.name;
-    std::vector<MessageSummary> rows = store_->ListFolder(shown->ref);
+    std::vector<MessageSummary> rows = store.ListFolder(shown->ref);
     ASSERT_EQ(rows.size(), f.items.size()) << f.name;
     for (size_t i = 0; i < rows.size(); ++i) {
       const fx::ManifestItem& want = f.items[i];
@@ -143,8 +71,8 @@ TEST_P(ModernStoreTest, TreeListsAndItemsMatchTheManifest) {
       SCOPED_TRACE(f.name + " item " + std::to_string(i) + ": " + want.subject);
       EXPECT_EQ(got.subject, want.subject);
       EXPECT_EQ(got.message_class, want.message_class);
-      EXPECT_EQ(got.created, Time(want.created));
-      EXPECT_EQ(got.received, Time(want.received));
+      EXPECT_EQ(got.created, ListTime(want.created));
+      EXPECT_EQ(got.received, ListTime(want.received));
       // Fields the builder left empty are not checked.
       if (!want.sender_shown.empty()) {
         EXPECT_EQ(got.sender, want.sender_shown);
@@ -155,23 +83,18 @@ TEST_P(ModernStoreTest, TreeListsAndItemsMatchTheManifest) {
       if (!want.flags_text.empty()) {
         EXPECT_EQ(got.flags_text, want.flags_text);
       }
-      if (GetParam().later_variant && !want.cc.empty()) {
+      if (c.later_variant && !want.cc.empty()) {
         EXPECT_EQ(got.cc, want.cc);
       }
       DecodePurpose purpose;
-      std::optional<ItemRecords> item = store_->OpenMessage(shown->ref, got.message_key, &purpose);
+      std::optional<ItemRecords> item = store.OpenMessage(shown->ref, got.message_key, &purpose);
       ASSERT_TRUE(item);
       ++items_checked;
       if (purpose == DecodePurpose::kMessageDetail && !want.body_html.empty()) {
         EXPECT_EQ(ByteView(item->message.body).ToString(), want.body_html);
       }
-      std::vector<AttachmentRecord> attachments =
-          store_->ListAttachments(shown->ref, got.message_key);
-      ASSERT_EQ(attachments.size(), want.attachments.size());
-      for (size_t k = 0; k < attachments.size(); ++k) {
-        EXPECT_EQ(attachments[k].name, want.attachments[k].name);
-        EXPECT_EQ(fx::Sha256Hex(ByteView(attachments[k].data)), want.attachments[k].sha256);
-      }
+      test_support::ExpectAttachments(store.ListAttachments(shown->ref, got.message_key),
+                                      want.attachments);
     }
   }
   EXPECT_GT(items_checked, 0u);

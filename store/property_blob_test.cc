@@ -6,11 +6,19 @@
 #include <string>
 #include <vector>
 
-#include "base/text.h"
 #include "engine/catalog_entry.h"
+#include "store/store_test_support.h"
 
 namespace tarnwell::store {
 namespace {
+
+using test_support::Append;
+using test_support::Cat;
+using test_support::Le16;
+using test_support::Le32;
+using test_support::Le64;
+using test_support::ServerBlob;
+using test_support::Wide;
 
 constexpr uint16_t kB = 0x0808, kL = 0x1818, kT = 0x3838, kS = 0x4848, kN = 0x5050, kMS = 0xC8C8;
 
@@ -24,47 +32,27 @@ struct Entry {
   bool bad_offset = false;  // point past the end of the blob
 };
 
-void AppendU16(Bytes* b, uint16_t v) {
-  b->push_back(uint8_t(v));
-  b->push_back(uint8_t(v >> 8));
-}
-void AppendU32(Bytes* b, uint32_t v) {
-  AppendU16(b, uint16_t(v));
-  AppendU16(b, uint16_t(v >> 16));
-}
-
 Bytes Blob(const std::vector<Entry>& entries, int count = -1) {
-  Bytes b = {'P', 'r', 'o', 'P', 0, 0};
-  AppendU16(&b, uint16_t(count < 0 ? entries.size() : size_t(count)));
+  Bytes b = Cat({{'P', 'r', 'o', 'P', 0, 0}, Le16(uint16_t(count < 0 ? entries.size() : count))});
   Bytes values;
-  size_t value_at = b.size() + 8 * entries.size();
+  const size_t value_at = b.size() + 8 * entries.size();
   for (const Entry& e : entries) {
-    AppendU16(&b, e.kind);
-    AppendU16(&b, e.id);
-    if (e.kind == kB || e.kind == kL) {
-      AppendU32(&b, e.inline_value);
-    } else {
-      AppendU32(&b, e.bad_offset ? 0xFFFFFFF0u : uint32_t(value_at + values.size()));
-      values.insert(values.end(), e.value.begin(), e.value.end());
-    }
+    const bool inline_value = e.kind == kB || e.kind == kL;
+    const uint32_t offset = e.bad_offset ? 0xFFFFFFF0u : uint32_t(value_at + values.size());
+    Append(&b, Cat({Le16(e.kind), Le16(e.id), Le32(inline_value ? e.inline_value : offset)}));
+    if (!inline_value) Append(&values, e.value);
   }
-  b.insert(b.end(), values.begin(), values.end());
+  Append(&b, values);
   return b;
 }
 
 Bytes Str(const std::string& text, uint8_t marker = 'M') {
-  Bytes b = {marker, uint8_t(text.size())};
-  b.insert(b.end(), text.begin(), text.end());
-  return b;
+  return Cat({{marker, uint8_t(text.size())}, Bytes(text.begin(), text.end())});
 }
 
 Bytes Multi(const std::vector<std::string>& items) {
   Bytes b = {0xC9, uint8_t(items.size())};
-  for (const std::string& item : items) {
-    b.push_back('M');
-    b.push_back(uint8_t(item.size()));
-    b.insert(b.end(), item.begin(), item.end());
-  }
+  for (const std::string& item : items) Append(&b, Str(item));
   return b;
 }
 
@@ -132,8 +120,7 @@ TEST(PropertyBlobTest, EdgeCases) {
 
 TEST(PropertyBlobTest, EntriesAreTypedLikeColumns) {
   const Bytes time = {0x00, 0x80, 0x3E, 0xD5, 0xDE, 0xB1, 0x9D, 0x01};
-  Bytes time_value = {'M', 8};
-  time_value.insert(time_value.end(), time.begin(), time.end());
+  const Bytes time_value = Cat({{'M', 8}, time});
   const std::vector<BlobEntry> entries =
       ParseBlobEntries(Blob({{kB, 0x63, 1},
                              {kL, 0x36, 0x01020304},
@@ -151,22 +138,6 @@ TEST(PropertyBlobTest, EntriesAreTypedLikeColumns) {
   EXPECT_EQ(entries[3].value, (Bytes{0xAA, 0xBB}));
 }
 
-// The same list fields from both layouts.
-Bytes ServerLayoutListBlob() {
-  // Entries: string 0x0042, 0x0E03, 0x0070, 0x0E1D, values with 8-bit text.
-  Bytes b = {'P', 'r', 'o', 'P', 0x00, 0x04, 4, 0};
-  for (uint16_t id : {0x0042, 0x0E03, 0x0070, 0x0E1D}) {
-    b.push_back(0x48);
-    AppendU16(&b, id);
-  }
-  for (const std::string text : {"Ann", "Bob", "Topic", "Hello"}) {
-    b.push_back(0x4D);
-    b.push_back(uint8_t(text.size()));
-    b.insert(b.end(), text.begin(), text.end());
-  }
-  return b;
-}
-
 struct ListCase {
   const char* what;
   Bytes blob;
@@ -179,12 +150,15 @@ TEST(PropertyBlobTest, ListParser) {
                                  {kS, 0xe03, 0, Str("Bob")},
                                  {kS, 0x70, 0, Str("Topic")},
                                  {kS, 0xe1d, 0, Str("Hello")}});
+  // The same list fields in the layout servers write.
+  const Bytes server_layout = ServerBlob({{0x48, 0x42}, {0x48, 0xE03}, {0x48, 0x70}, {0x48, 0xE1D}},
+                                         Cat({Str("Ann"), Str("Bob"), Str("Topic"), Str("Hello")}));
   const Bytes topic_only = Blob({{kS, 0x70, 0, Str("Topic")}});
   const std::vector<ListCase> cases = {
       {"8-byte entries", doc_layout, false, "Ann", "", "Re: Hello"},
       {"8-byte entries, later variant", doc_layout, true, "Ann", "Bob", "Re: Hello"},
-      {"server layout", ServerLayoutListBlob(), false, "Ann", "", "Re: Hello"},
-      {"server layout, later variant", ServerLayoutListBlob(), true, "Ann", "Bob", "Re: Hello"},
+      {"server layout", server_layout, false, "Ann", "", "Re: Hello"},
+      {"server layout, later variant", server_layout, true, "Ann", "Bob", "Re: Hello"},
       {"topic without subject", topic_only, false, "", "", "Re: "},
       {"topic without subject, later variant", topic_only, true, "", "", "Re: Topic"},
       {"not a blob", Bytes{1, 2, 3}, true, "", "", "Re: "},
@@ -202,102 +176,82 @@ TEST(PropertyBlobTest, ListParser) {
   }
 }
 
-Bytes Utf16(const std::string& text) { return Utf8ToUtf16LE(text); }
-Bytes U32(uint32_t v) {
-  Bytes b;
-  AppendU32(&b, v);
-  return b;
-}
-
 constexpr uint64_t kFileTime = 0x01D9B1DED53E8000ull;
-Bytes U64(uint64_t v) {
-  Bytes b = U32(uint32_t(v));
-  const Bytes high = U32(uint32_t(v >> 32));
-  b.insert(b.end(), high.begin(), high.end());
-  return b;
+
+// Both results must equal what was written.
+template <typename A, typename B>
+void ExpectBoth(const A& from_blob, const A& from_columns, const B& want) {
+  EXPECT_EQ(from_blob, want);
+  EXPECT_EQ(from_columns, want);
 }
 
 // A blob must fill the records exactly as columns of the same names do.
 TEST(PropertyBlobTest, DetailParserFeedsTheColumnRules) {
-  PropertyDecoder decoder(kStoreExchange2013);
-  InstallPropertyBlobParser(&decoder);
-
-  // A message, from a blob with 8-byte entries.
-  Bytes time_value = {'M', 8};
-  const Bytes time = U64(kFileTime);
-  time_value.insert(time_value.end(), time.begin(), time.end());
-  const Bytes message_blob = Blob({{kS, 0x7d, 0, Str("Received: x")},
-                                   {kL, 0x36, 2},
-                                   {kT, 0x3007, 0, time_value},
-                                   {kB, 0x63, 1},
-                                   {kN, 0x71, 0, Bytes{'N', 3, 1, 2, 3}},
-                                   {kMS, 0x813a, 0, Multi({"p", "q"})}});
-  ItemRecords from_blob, from_columns;
-  EXPECT_EQ(decoder.Decode(DecodePurpose::kMessageDetail, "PropertyBlob", engine::kColumnLongBinary,
-                           0, message_blob, &from_blob),
-            1);
   using engine::kColumnBinary, engine::kColumnBit, engine::kColumnLong, engine::kColumnLongLong,
       engine::kColumnLongText, engine::kColumnShort;
-  const auto column = [&](DecodePurpose purpose, const char* name, uint32_t type,
-                          const Bytes& value) {
-    decoder.Decode(purpose, name, type, kCodePageUtf16LE, value, &from_columns);
+  PropertyDecoder decoder(kStoreExchange2013);
+  InstallPropertyBlobParser(&decoder);
+  struct Column {
+    const char* name;
+    uint32_t type;
+    Bytes value;
   };
-  const DecodePurpose kMessage = DecodePurpose::kMessageDetail;
-  column(kMessage, "S7d", kColumnLongText, Utf16("Received: x"));
-  column(kMessage, "L36", kColumnLong, U32(2));
-  column(kMessage, "T3007", kColumnLongLong, U64(kFileTime));
-  column(kMessage, "B63", kColumnBit, {1});
-  column(kMessage, "N71", kColumnBinary, {1, 2, 3});
-  column(kMessage, "MS813a", kColumnLongText, Utf16("p;q"));
+  ItemRecords from_blob, from_columns;
+  const auto decode = [&](DecodePurpose purpose, const Bytes& blob,
+                          const std::vector<Column>& columns) {
+    EXPECT_EQ(
+        decoder.Decode(purpose, "PropertyBlob", engine::kColumnLongBinary, 0, blob, &from_blob), 1);
+    for (const Column& c : columns) {
+      decoder.Decode(purpose, c.name, c.type, kCodePageUtf16LE, c.value, &from_columns);
+    }
+  };
+  const Bytes time = Le64(kFileTime);
+
+  // A message, from a blob with 8-byte entries.
+  decode(DecodePurpose::kMessageDetail,
+         Blob({{kS, 0x7d, 0, Str("Received: x")},
+               {kL, 0x36, 2},
+               {kT, 0x3007, 0, Cat({{'M', 8}, time})},
+               {kB, 0x63, 1},
+               {kN, 0x71, 0, Bytes{'N', 3, 1, 2, 3}},
+               {kMS, 0x813a, 0, Multi({"p", "q"})}}),
+         {{"S7d", kColumnLongText, Wide("Received: x")},
+          {"L36", kColumnLong, Le32(2)},
+          {"T3007", kColumnLongLong, time},
+          {"B63", kColumnBit, {1}},
+          {"N71", kColumnBinary, {1, 2, 3}},
+          {"MS813a", kColumnLongText, Wide("p;q")}});
   const MessageRecord& a = from_blob.message;
   const MessageRecord& b = from_columns.message;
-  EXPECT_EQ(a.transport_headers, "Received: x");
-  EXPECT_EQ(a.transport_headers, b.transport_headers);
-  EXPECT_EQ(a.sensitivity, 2u);
-  EXPECT_EQ(a.sensitivity, b.sensitivity);
-  EXPECT_EQ(a.creation_time, kFileTime);
-  EXPECT_EQ(a.creation_time, b.creation_time);
-  EXPECT_EQ(a.response_requested, 1);
-  EXPECT_EQ(a.response_requested, b.response_requested);
-  EXPECT_EQ(a.conversation_index, b.conversation_index);
-  EXPECT_EQ(a.named_multi_string, "p;q");
-  EXPECT_EQ(a.named_multi_string, b.named_multi_string);
+  ExpectBoth(a.transport_headers, b.transport_headers, "Received: x");
+  ExpectBoth(a.sensitivity, b.sensitivity, 2u);
+  ExpectBoth(a.creation_time, b.creation_time, kFileTime);
+  ExpectBoth(a.response_requested, b.response_requested, 1);
+  ExpectBoth(a.conversation_index, b.conversation_index, Bytes{1, 2, 3});
+  ExpectBoth(a.named_multi_string, b.named_multi_string, "p;q");
 
   // A contact, from a blob of the server layout.
-  Bytes contact_blob = {'P', 'r', 'o', 'P', 0x00, 0x04, 5, 0};
-  const std::vector<std::pair<uint8_t, uint16_t>> props = {
-      {0x48, 0x3a06}, {0x38, 0x3a42}, {0x10, 0x3a4d}, {0x18, 0x8098}, {0xC8, 0x3a58}};
-  for (const auto& [type, id] : props) {
-    contact_blob.push_back(type);
-    AppendU16(&contact_blob, id);
-  }
-  const Bytes values = {0x49, 6, 'A', 0, 'n', 0, 'n', 0,  // UTF-16 "Ann"
-                        0x38};
-  contact_blob.insert(contact_blob.end(), values.begin(), values.end());
-  contact_blob.insert(contact_blob.end(), time.begin(), time.end());
-  const Bytes more = {0x11, 2,                                      // gender 2
-                      0x1B, 0x78, 0x56, 0x34, 0x12,                 // 0x12345678
-                      0xC9, 2,    0x4D, 1,    'x',  0x4D, 1, 'y'};  // "x", "y"
-  contact_blob.insert(contact_blob.end(), more.begin(), more.end());
-  const DecodePurpose kContact = DecodePurpose::kContactDetail;
-  EXPECT_EQ(decoder.Decode(kContact, "PropertyBlob", engine::kColumnLongBinary, 0, contact_blob,
-                           &from_blob),
-            1);
-  column(kContact, "S3a06", kColumnLongText, Utf16("Ann"));
-  column(kContact, "T3a42", kColumnLongLong, U64(kFileTime));
-  column(kContact, "I3a4d", kColumnShort, {2, 0});
-  column(kContact, "L8098", kColumnLong, U32(0x12345678));
-  column(kContact, "MS3a58", kColumnLongText, Utf16("x;y"));
+  const Bytes contact_blob =
+      ServerBlob({{0x48, 0x3a06}, {0x38, 0x3a42}, {0x10, 0x3a4d}, {0x18, 0x8098}, {0xC8, 0x3a58}},
+                 Cat({{0x49, 6, 'A', 0, 'n', 0, 'n', 0},  // UTF-16 "Ann"
+                      {0x38},
+                      time,
+                      {0x11, 2},                                 // gender 2
+                      {0x1B, 0x78, 0x56, 0x34, 0x12},            // 0x12345678
+                      {0xC9, 2, 0x4D, 1, 'x', 0x4D, 1, 'y'}}));  // "x", "y"
+  decode(DecodePurpose::kContactDetail, contact_blob,
+         {{"S3a06", kColumnLongText, Wide("Ann")},
+          {"T3a42", kColumnLongLong, time},
+          {"I3a4d", kColumnShort, {2, 0}},
+          {"L8098", kColumnLong, Le32(0x12345678)},
+          {"MS3a58", kColumnLongText, Wide("x;y")}});
   const ContactRecord& c = from_blob.contact;
   const ContactRecord& d = from_columns.contact;
   EXPECT_EQ(c.strings.size(), 2u);
   EXPECT_EQ(c.strings, d.strings);
-  EXPECT_EQ(c.birthday, kFileTime);
-  EXPECT_EQ(c.birthday, d.birthday);
-  EXPECT_EQ(c.gender, 2);
-  EXPECT_EQ(c.gender, d.gender);
-  EXPECT_EQ(c.contact_value, 0x12345678u);
-  EXPECT_EQ(c.contact_value, d.contact_value);
+  ExpectBoth(c.birthday, d.birthday, kFileTime);
+  ExpectBoth(c.gender, d.gender, 2);
+  ExpectBoth(c.contact_value, d.contact_value, 0x12345678u);
 
   // A blob's entries never reach records whose purpose is off.
   ItemRecords untouched;
@@ -310,11 +264,7 @@ TEST(PropertyBlobTest, DetailParserFeedsTheColumnRules) {
 
 TEST(PropertyBlobTest, FarValuesComeFromTheRow) {
   // One string property whose value lives in "SeparatedProperty02".
-  Bytes blob = {'P', 'r', 'o', 'P', 0x00, 0x04, 1, 0, 0x48, 0x7d, 0x00, 0x7A};
-  AppendU16(&blob, 2);
-  AppendU32(&blob, 5);
-  AppendU16(&blob, 0x48);
-  AppendU32(&blob, 4);
+  const Bytes blob = ServerBlob({{0x48, 0x7d}}, test_support::FarRef(2, 5, 0x48, 4));
   PropertyDecoder decoder(kStoreExchange2013);
   BlobParserOptions options;
   std::vector<uint16_t> asked;

@@ -9,13 +9,15 @@
 #include <random>
 
 #include "base/date_time.h"
-#include "base/text.h"
 #include "engine/catalog_entry.h"
-#include "store/typed_binary.h"
+#include "store/store_test_support.h"
 
 namespace tarnwell::store {
 namespace {
 
+using test_support::Le32;
+using test_support::Le64;
+using test_support::Wide;
 using P = DecodePurpose;
 
 constexpr uint32_t kBit = engine::kColumnBit;
@@ -39,27 +41,10 @@ constexpr int kAllVersions[] = {kStoreExchange2000, kStoreExchange2007, kStoreEx
 // 2018-09-20 09:40:00 UTC.
 constexpr uint64_t kSomeTime = 0x01D450C5E61C9800ull;
 
-Bytes Le32(uint32_t v) {
-  Bytes b(4);
-  StoreU32LE(b.data(), v);
-  return b;
-}
-Bytes Le64(uint64_t v) {
-  Bytes b(8);
-  StoreU64LE(b.data(), v);
-  return b;
-}
 Bytes Be64(uint64_t v) {
   Bytes b(8);
   StoreU32BE(b.data(), uint32_t(v >> 32));
   StoreU32BE(b.data() + 4, uint32_t(v));
-  return b;
-}
-// A UTF-16LE text value with its terminator, as the store keeps them.
-Bytes Wide(std::string_view utf8) {
-  Bytes b = Utf8ToUtf16LE(utf8);
-  b.push_back(0);
-  b.push_back(0);
   return b;
 }
 Bytes Raw(std::string_view s) { return Bytes(s.begin(), s.end()); }
@@ -102,56 +87,39 @@ TEST_F(PropertyDecoderTest, FlagsTextAndReadState) {
   }
 }
 
-// Each row: the same instant written the way one store version writes it.
-struct TimeCase {
-  const char* what;
-  int version;
-  uint32_t type;
-  Bytes value;
-  int result;
-  bool stored;
-};
-
-class TimeByteOrderTest : public PropertyDecoderTest,
-                          public ::testing::WithParamInterface<TimeCase> {};
-
-TEST_P(TimeByteOrderTest, ListDateAndDetailTime) {
-  const TimeCase& c = GetParam();
-  const PropertyDecoder d(c.version);
-  ItemRecords r;
-  EXPECT_EQ(Put(d, P::kMessageListRow, "T3007", c.type, c.value, &r), c.result);
-  EXPECT_EQ(r.summary.created, c.stored ? DateText(kSomeTime) : "");
-  if (c.stored) {
-    EXPECT_EQ(r.summary.created, "20/09/2018 09:40:00");
+// The same instant written the way each store version writes it, as a list
+// date and as a detail time.
+TEST_F(PropertyDecoderTest, TimesInEachVersionsByteOrder) {
+  struct Case {
+    const char* what;
+    int version;
+    uint32_t type;
+    Bytes value;
+    int result;  // 1: the time is stored
+  } cases[] = {
+      {"legacy binary, big-endian", kStoreExchange2000, kBinary, Be64(kSomeTime), 1},
+      {"2007 long binary, big-endian", kStoreExchange2007, kLongBinary, Be64(kSomeTime), 1},
+      {"5.5 binary, big-endian", kStoreExchange55, kBinary, Be64(kSomeTime), 1},
+      {"2010 binary, little-endian", kStoreExchange2010, kBinary, Le64(kSomeTime), 1},
+      {"long long", kStoreExchange2000, kLongLong, Le64(kSomeTime), 1},
+      {"currency", kStoreExchange2007, kCurrency, Le64(kSomeTime), 1},
+      {"date-time", kStoreExchange2013, kDateTime, Le64(kSomeTime), 1},
+      {"binary of 7 bytes is no time", kStoreExchange2000, kBinary, Bytes(7, 1), 0},
+      {"binary of 9 bytes is no time", kStoreExchange2010, kBinary, Bytes(9, 1), 0},
+      {"long long too short", kStoreExchange2000, kLongLong, Bytes(4, 1), -1},
+      {"text is no time", kStoreExchange2000, kText, Wide("2018"), 0},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.what);
+    const PropertyDecoder d(c.version);
+    const bool stored = c.result == 1;
+    ItemRecords r;
+    EXPECT_EQ(Put(d, P::kMessageListRow, "T3007", c.type, c.value, &r), c.result);
+    EXPECT_EQ(r.summary.created, stored ? "20/09/2018 09:40:00" : "");
+    EXPECT_EQ(Put(d, P::kAppointmentDetail, "T60", c.type, c.value, &r), c.result);
+    EXPECT_EQ(r.appointment.start_time, stored ? FileTime(kSomeTime) : std::nullopt);
   }
-  EXPECT_EQ(Put(d, P::kAppointmentDetail, "T60", c.type, c.value, &r), c.result);
-  EXPECT_EQ(r.appointment.start_time, c.stored ? FileTime(kSomeTime) : std::nullopt);
 }
-
-INSTANTIATE_TEST_SUITE_P(
-    Versions, TimeByteOrderTest,
-    ::testing::Values(
-        TimeCase{"legacy binary, big-endian", kStoreExchange2000, kBinary, Be64(kSomeTime), 1,
-                 true},
-        TimeCase{"2007 long binary, big-endian", kStoreExchange2007, kLongBinary, Be64(kSomeTime),
-                 1, true},
-        TimeCase{"5.5 binary, big-endian", kStoreExchange55, kBinary, Be64(kSomeTime), 1, true},
-        TimeCase{"2010 binary, little-endian", kStoreExchange2010, kBinary, Le64(kSomeTime), 1,
-                 true},
-        TimeCase{"long long", kStoreExchange2000, kLongLong, Le64(kSomeTime), 1, true},
-        TimeCase{"currency", kStoreExchange2007, kCurrency, Le64(kSomeTime), 1, true},
-        TimeCase{"date-time", kStoreExchange2013, kDateTime, Le64(kSomeTime), 1, true},
-        TimeCase{"binary of 7 bytes is no time", kStoreExchange2000, kBinary, Bytes(7, 1), 0,
-                 false},
-        TimeCase{"binary of 9 bytes is no time", kStoreExchange2010, kBinary, Bytes(9, 1), 0,
-                 false},
-        TimeCase{"long long too short", kStoreExchange2000, kLongLong, Bytes(4, 1), -1, false},
-        TimeCase{"text is no time", kStoreExchange2000, kText, Wide("2018"), 0, false}),
-    [](const auto& info) {
-      std::string name;
-      for (char ch : std::string(info.param.what)) name += isalnum(ch) ? ch : '_';
-      return name;
-    });
 
 TEST_F(PropertyDecoderTest, SubjectIsPrefixThenNormalizedInEitherOrder) {
   struct Case {
@@ -169,30 +137,6 @@ TEST_F(PropertyDecoderTest, SubjectIsPrefixThenNormalizedInEitherOrder) {
     }
     EXPECT_EQ(r.summary.subject, "RE: Budget") << c.prefix_name << " first=" << c.prefix_first;
   }
-}
-
-TEST_F(PropertyDecoderTest, Exchange55ListTakesNoToLineOrSender) {
-  struct Case {
-    const char* name;
-    std::string MessageSummary::*field;
-  } cases[] = {{"Se04", &MessageSummary::to},
-               {"S678e", &MessageSummary::to},
-               {"S42", &MessageSummary::sender}};
-  for (const Case& c : cases) {
-    for (int version : kAllVersions) {
-      const PropertyDecoder d(version);
-      ItemRecords r;
-      const bool takes = version != kStoreExchange55;
-      EXPECT_EQ(Put(d, P::kMessageListRow, c.name, kLongText, Wide("Anna"), &r), takes ? 1 : 0)
-          << c.name << " version " << version;
-      EXPECT_EQ(r.summary.*(c.field), takes ? "Anna" : "");
-    }
-  }
-  // The rest of the list row is the same for 5.5.
-  const PropertyDecoder d55(kStoreExchange55);
-  ItemRecords r;
-  EXPECT_EQ(Put(d55, P::kMessageListRow, "S1a", kLongText, Wide("IPM.Note"), &r), 1);
-  EXPECT_EQ(r.summary.message_class, "IPM.Note");
 }
 
 // A value is stored only under the purposes of its rules; under every other
@@ -441,6 +385,8 @@ TEST_F(PropertyDecoderTest, ColumnsTakenBySomeVersionsOnly) {
     }
     return b;
   }();
+  const std::vector<int> all_but_55 = {kStoreExchange2000, kStoreExchange2007, kStoreExchange2010,
+                                       kStoreExchange2013};
   struct Case {
     const char* name;
     P purpose;
@@ -448,6 +394,15 @@ TEST_F(PropertyDecoderTest, ColumnsTakenBySomeVersionsOnly) {
     Bytes value;
     std::vector<int> versions;  // those that store it
   } cases[] = {
+      // Exchange 5.5 list rows take no To line or sender; the rest of the row is the same.
+      {"Se04", P::kMessageListRow, kLongText, Wide("Anna"), all_but_55},
+      {"S678e", P::kMessageListRow, kLongText, Wide("Anna"), all_but_55},
+      {"S42", P::kMessageListRow, kLongText, Wide("Anna"), all_but_55},
+      {"S1a",
+       P::kMessageListRow,
+       kLongText,
+       Wide("Anna"),
+       {std::begin(kAllVersions), std::end(kAllVersions)}},
       {"MN81a9",
        P::kMessageDetail,
        kLongBinary,
@@ -469,6 +424,10 @@ TEST_F(PropertyDecoderTest, ColumnsTakenBySomeVersionsOnly) {
       if (takes && c.purpose == P::kMessageDetail) {
         ASSERT_EQ(r.message.members.size(), 1u);
         EXPECT_EQ(r.message.members[0].email_address, "anna@example.org");
+      }
+      if (c.purpose == P::kMessageListRow) {
+        const MessageSummary& m = r.summary;
+        EXPECT_EQ(m.to + m.sender + m.message_class, takes ? "Anna" : "") << c.name;
       }
       if (takes && c.purpose == P::kAppointmentDetail) {
         EXPECT_EQ(r.appointment.value, 9u);

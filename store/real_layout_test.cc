@@ -4,14 +4,12 @@
 // lists, named-property maps) must hold up against damage.
 #include <gtest/gtest.h>
 
-#include <filesystem>
 #include <sstream>
 
-#include "base/paths.h"
-#include "engine/catalog.h"
 #include "store/modern_store.h"
 #include "store/named_property_map.h"
 #include "store/recipient_list.h"
+#include "store/store_test_support.h"
 #include "store/subobjects_blob.h"
 #include "testing/exchange/modern_store_builder.h"
 #include "testing/exchange/real_blob_encoder.h"
@@ -20,70 +18,19 @@ namespace tarnwell::store {
 namespace {
 
 namespace fx = forge::exchange;
+using Store = test_support::OpenedStore<ModernStore>;
+using test_support::Cat;
 
-class OpenStore {
- public:
-  explicit OpenStore(bool real_layout) {
-    EXPECT_TRUE(MakeTempDir("tarnwell-real", &dir_).ok());
-    fx::ModernStoreOptions options;
-    options.later_2013_variant = true;
-    options.real_layout = real_layout;
-    const std::string path = dir_ + "/store.edb";
-    Status s = fx::BuildModernStore(options, path, &manifest);
-    EXPECT_TRUE(s.ok()) << s.ToString();
-    reader_ = engine::MakeReader(engine::kExchange2013);
-    EXPECT_TRUE(reader_->OpenDatabase(path, {}, engine::kExchange2013));
-    EXPECT_EQ(reader_->CollectTreeRecords(engine::kCatalogRootPage), 1);
-    EXPECT_EQ(reader_->ParseCatalogRecords(), 1);
-    reader_->GetTableNames();
-    store = std::make_unique<ModernStore>(*reader_, engine::kExchange2013, ScanMode::kStandard);
-    store->SetWorkFolder(dir_);
-    EXPECT_TRUE(store->WalkMailboxes());
-    EXPECT_TRUE(store->WalkFolders());
-    store->LinkTree(NullProgress());
-    EXPECT_TRUE(store->ShowTree(path, 1, tree_));
-  }
-  ~OpenStore() {
-    store.reset();
-    reader_.reset();
-    std::filesystem::remove_all(dir_);
-  }
-
-  // The folder at `path` (mailbox name first).
-  std::optional<FolderRef> Find(const std::vector<std::string>& path) {
-    auto it = tree_.refs.find(path);
-    if (it == tree_.refs.end()) return std::nullopt;
-    return it->second;
-  }
-
-  fx::StoreManifest manifest;
-  std::unique_ptr<ModernStore> store;
-
- private:
-  struct Tree : FolderTreeSink {
-    int64_t AddTopItem(const std::string&, int, uint64_t) override { return 0; }
-    int64_t AddFolder(int64_t parent, const std::string& text, int, uint32_t index) override {
-      return Add(parent, text, {-1, index});
-    }
-    int64_t AddMailboxFolder(int64_t parent, const std::string& text, int, int32_t mailbox,
-                             uint32_t index) override {
-      return Add(parent, text, {mailbox, index});
-    }
-    int64_t Add(int64_t parent, const std::string& text, FolderRef ref) {
-      std::vector<std::string> path = paths[parent];
-      path.push_back(text);
-      paths.push_back(path);
-      refs[path] = ref;
-      return int64_t(paths.size()) - 1;
-    }
-    std::vector<std::vector<std::string>> paths = {{}};
-    std::map<std::vector<std::string>, FolderRef> refs;
-  };
-
-  std::string dir_;
-  std::unique_ptr<engine::EdbClass> reader_;
-  Tree tree_;
-};
+// A later-2013 mailbox store in the documented or the server layout.
+void Open(bool real_layout, Store* s) {
+  fx::ModernStoreOptions options;
+  options.later_2013_variant = true;
+  options.real_layout = real_layout;
+  const Status built = fx::BuildModernStore(options, s->path(), &s->manifest);
+  ASSERT_TRUE(built.ok()) << built.ToString();
+  ASSERT_TRUE(s->Open(engine::kExchange2013, ScanMode::kStandard));
+  EXPECT_TRUE(s->walked_mailboxes && s->walked_folders);
+}
 
 std::string Time(const FileTime& t) { return t ? std::to_string(*t) : "-"; }
 
@@ -117,15 +64,20 @@ std::string Describe(const MessageSummary& s, DecodePurpose purpose, const ItemR
 }
 
 TEST(RealLayoutTest, BothLayoutsDecodeToTheSameRecords) {
-  OpenStore documented(false), real(true);
+  Store documented("tarnwell-real"), real("tarnwell-real");
+  ASSERT_NO_FATAL_FAILURE(Open(false, &documented));
+  ASSERT_NO_FATAL_FAILURE(Open(true, &real));
   ASSERT_TRUE(real.manifest.real_layout);
   size_t compared = 0;
   bool saw_members = false, saw_percent = false, saw_gender = false, saw_end = false;
   for (const fx::ManifestFolder& f : real.manifest.folders) {
     if (f.items.empty()) continue;
     SCOPED_TRACE(f.name);
-    std::optional<FolderRef> a = documented.Find(f.path), b = real.Find(f.path);
-    ASSERT_TRUE(a && b);
+    const auto* shown_a = documented.tree.Find(f.path);
+    const auto* shown_b = real.tree.Find(f.path);
+    ASSERT_TRUE(shown_a && shown_b);
+    const FolderRef* a = &shown_a->ref;
+    const FolderRef* b = &shown_b->ref;
     const std::vector<MessageSummary> rows_a = documented.store->ListFolder(*a);
     const std::vector<MessageSummary> rows_b = real.store->ListFolder(*b);
     ASSERT_EQ(rows_a.size(), rows_b.size());
@@ -185,12 +137,6 @@ Bytes RecipientBlob(uint32_t type, const std::string& name) {
   e.AddString(0x3002, "SMTP");
   e.AddString(0x3003, "x@example.org");
   return e.Finish(nullptr);
-}
-
-Bytes Cat(std::vector<Bytes> parts) {
-  Bytes out;
-  for (const Bytes& p : parts) out.insert(out.end(), p.begin(), p.end());
-  return out;
 }
 
 TEST(RecipientListTest, EveryBlobIsFoundWhateverTheFrame) {

@@ -10,39 +10,17 @@
 
 #include "engine/catalog_entry.h"
 #include "engine/compress/compressed_value.h"
+#include "store/store_test_support.h"
 
 namespace tarnwell::store {
 namespace {
 
-constexpr uint16_t kPlain = 0x0400;
-constexpr uint16_t kWithNearArea = 0x0401;
-
-struct Property {
-  uint8_t type;
-  uint16_t id;
-};
-
-void Append(Bytes* out, const Bytes& more) { out->insert(out->end(), more.begin(), more.end()); }
-void AppendU16(Bytes* out, uint16_t v) { Append(out, {uint8_t(v), uint8_t(v >> 8)}); }
-void AppendU32(Bytes* out, uint32_t v) {
-  AppendU16(out, uint16_t(v));
-  AppendU16(out, uint16_t(v >> 16));
-}
-
-// A blob of the server layout with the given entries and value bytes.
-Bytes Blob(const std::vector<Property>& props, const Bytes& values, uint16_t flags = kPlain,
-           uint32_t near_area = 0) {
-  Bytes b = {'P', 'r', 'o', 'P'};
-  AppendU16(&b, flags);
-  AppendU16(&b, uint16_t(props.size()));
-  if (flags == kWithNearArea) AppendU32(&b, near_area);
-  for (const Property& p : props) {
-    b.push_back(p.type);
-    AppendU16(&b, p.id);
-  }
-  Append(&b, values);
-  return b;
-}
+using test_support::Cat;
+using test_support::kWithNearArea;
+using test_support::Le32;
+using test_support::Le64;
+using test_support::NearRef;
+using test_support::ServerBlob;
 
 Bytes Text(const std::string& s) { return Bytes(s.begin(), s.end()); }
 
@@ -53,148 +31,81 @@ struct EncodingCase {
   const char* what;
   uint8_t type;
   Bytes encoded;
-  const char* name;  // for id 0x1234
+  const char* prefix;  // of the name, before the id 1234
   uint32_t engine_type;
   Bytes value;
   BlobValueState state = BlobValueState::kValue;
   size_t items = 0;
 };
 
-Bytes Cat(Bytes a, const Bytes& b) {
-  Append(&a, b);
-  return a;
-}
-
 const std::vector<EncodingCase>& EncodingCases() {
-  using engine::kColumnBinary, engine::kColumnBit, engine::kColumnShort, engine::kColumnLong,
-      engine::kColumnLongLong, engine::kColumnCurrency, engine::kColumnFloat, engine::kColumnDouble,
-      engine::kColumnGuid, engine::kColumnText;
+  constexpr uint32_t kBin = engine::kColumnBinary, kBit = engine::kColumnBit,
+                     kI16 = engine::kColumnShort, kI32 = engine::kColumnLong,
+                     kI64 = engine::kColumnLongLong, kCur = engine::kColumnCurrency,
+                     kF32 = engine::kColumnFloat, kF64 = engine::kColumnDouble,
+                     kGid = engine::kColumnGuid, kTxt = engine::kColumnText;
+  constexpr auto kUnknown = BlobValueState::kUnknownEncoding;
+  constexpr auto kValue = BlobValueState::kValue;
+  const char* kEuroX = "\xE2\x82\xACx";
   const Bytes eight = {1, 2, 3, 4, 5, 6, 7, 8};
+  // clang-format off
   static const std::vector<EncodingCase> cases = {
-      {"bool false", 0x08, {0x08}, "B1234", kColumnBit, {0}},
-      {"bool true", 0x08, {0x09}, "B1234", kColumnBit, {1}},
-      {"int16 zero", 0x10, {0x10}, "I1234", kColumnShort, {0, 0}},
-      {"int16 one byte, negative", 0x10, {0x11, 0xFE}, "I1234", kColumnShort, {0xFE, 0xFF}},
-      {"int16 two bytes", 0x10, {0x12, 0x34, 0x12}, "I1234", kColumnShort, {0x34, 0x12}},
-      {"int32 zero", 0x18, {0x18}, "L1234", kColumnLong, {0, 0, 0, 0}},
-      {"int32 one byte, positive", 0x18, {0x19, 0x7F}, "L1234", kColumnLong, {0x7F, 0, 0, 0}},
-      {"int32 one byte, negative",
-       0x18,
-       {0x19, 0x80},
-       "L1234",
-       kColumnLong,
-       {0x80, 0xFF, 0xFF, 0xFF}},
-      {"int32 two bytes, negative",
-       0x18,
-       {0x1A, 0x00, 0x80},
-       "L1234",
-       kColumnLong,
-       {0x00, 0x80, 0xFF, 0xFF}},
-      {"int32 four bytes",
-       0x18,
-       {0x1B, 0x78, 0x56, 0x34, 0x12},
-       "L1234",
-       kColumnLong,
-       {0x78, 0x56, 0x34, 0x12}},
-      {"int64 zero", 0x20, {0x20}, "Q1234", kColumnLongLong, Bytes(8, 0)},
-      {"int64 one byte", 0x20, {0x21, 0xFF}, "Q1234", kColumnLongLong, Bytes(8, 0xFF)},
-      {"int64 two bytes",
-       0x20,
-       {0x22, 0x01, 0x02},
-       "Q1234",
-       kColumnLongLong,
-       {1, 2, 0, 0, 0, 0, 0, 0}},
-      {"int64 four bytes, negative",
-       0x20,
-       {0x23, 0, 0, 0, 0x80},
-       "Q1234",
-       kColumnLongLong,
-       {0, 0, 0, 0x80, 0xFF, 0xFF, 0xFF, 0xFF}},
-      {"int64 eight bytes", 0x20, Cat({0x24}, eight), "Q1234", kColumnLongLong, eight},
-      {"currency", 0x24, Cat({0x24}, eight), "Q1234", kColumnCurrency, eight},
-      {"currency zero", 0x24, {0x20}, "Q1234", kColumnCurrency, Bytes(8, 0)},
-      {"float", 0x28, {0x28, 0, 0, 0x80, 0x3F}, "D1234", kColumnFloat, {0, 0, 0x80, 0x3F}},
-      {"float zero", 0x28, {0x2A}, "D1234", kColumnFloat, Bytes(4, 0)},
-      {"double", 0x30, Cat({0x30}, eight), "D1234", kColumnDouble, eight},
-      {"double zero", 0x30, {0x32}, "D1234", kColumnDouble, Bytes(8, 0)},
-      {"app-time", 0x34, Cat({0x30}, eight), "D1234", kColumnDouble, eight},
-      {"time", 0x38, Cat({0x38}, eight), "T1234", kColumnLongLong, eight},
-      {"time, short form kept unread",
-       0x38,
-       {0x39, 1, 2, 3, 4},
-       "T1234",
-       kColumnBinary,
-       {1, 2, 3, 4},
-       BlobValueState::kUnknownEncoding},
-      {"guid", 0x40, Cat({0x40}, kGuid), "G1234", kColumnGuid, kGuid},
-      {"string empty", 0x48, {0x48}, "S1234", kColumnText, {}},
-      {"string 8-bit, u8 length",
-       0x48,
-       {0x4D, 3, 'a', 'b', 0xE9},
-       "S1234",
-       kColumnText,
-       Text("ab\xC3\xA9")},
-      {"string 8-bit, u16 length", 0x48, {0x4E, 2, 0, 'h', 'i'}, "S1234", kColumnText, Text("hi")},
-      {"string UTF-16, u8 length",
-       0x48,
-       {0x49, 4, 0xAC, 0x20, 'x', 0},
-       "S1234",
-       kColumnText,
-       Text("\xE2\x82\xACx")},
-      {"string UTF-16, u16 length", 0x48, {0x4A, 2, 0, 'y', 0}, "S1234", kColumnText, Text("y")},
-      {"binary empty", 0x50, {0x50}, "N1234", kColumnBinary, {}},
-      {"binary, u8 length", 0x50, {0x51, 2, 0xAA, 0xBB}, "N1234", kColumnBinary, {0xAA, 0xBB}},
-      {"binary, u16 length", 0x50, {0x52, 1, 0, 0xCC}, "N1234", kColumnBinary, {0xCC}},
-      {"multi int16, u8 count",
-       0x90,
-       {0x91, 2, 1, 0, 2, 0},
-       "MI1234",
-       kColumnBinary,
-       {1, 0, 2, 0},
-       BlobValueState::kValue,
-       2},
-      {"multi int32, u16 count",
-       0x98,
-       {0x9A, 1, 0, 7, 0, 0, 0},
-       "ML1234",
-       kColumnBinary,
-       {7, 0, 0, 0},
-       BlobValueState::kValue,
-       1},
-      {"multi time, none", 0xB8, {0xB9, 0}, "MT1234", kColumnBinary, {}, BlobValueState::kValue, 0},
-      {"multi guid", 0xC0, Cat({0xC1, 1}, kGuid), "MG1234", kColumnBinary, kGuid,
-       BlobValueState::kValue, 1},
-      {"multi string, mixed encodings",
-       0xC8,
-       {0xC9, 3, 0x4D, 1, 'a', 0x48, 0x49, 2, 'b', 0},
-       "MS1234",
-       kColumnText,
-       Text("a;;b"),
-       BlobValueState::kValue,
-       3},
-      {"multi binary",
-       0xD0,
-       {0xD2, 2, 0, 0x51, 1, 0xAA, 0x50},
-       "MN1234",
-       kColumnBinary,
-       {},
-       BlobValueState::kValue,
-       2},
-      {"deleted", 0x18, {0x00}, "L1234", kColumnLong, {}, BlobValueState::kDeleted},
+      {"bool false", 0x08, {0x08}, "B", kBit, {0}},
+      {"bool true", 0x08, {0x09}, "B", kBit, {1}},
+      {"int16 zero", 0x10, {0x10}, "I", kI16, {0, 0}},
+      {"int16 1 byte negative", 0x10, {0x11, 0xFE}, "I", kI16, {0xFE, 0xFF}},
+      {"int16 2 bytes", 0x10, {0x12, 0x34, 0x12}, "I", kI16, {0x34, 0x12}},
+      {"int32 zero", 0x18, {0x18}, "L", kI32, {0, 0, 0, 0}},
+      {"int32 1 byte positive", 0x18, {0x19, 0x7F}, "L", kI32, {0x7F, 0, 0, 0}},
+      {"int32 1 byte negative", 0x18, {0x19, 0x80}, "L", kI32, {0x80, 0xFF, 0xFF, 0xFF}},
+      {"int32 2 bytes negative", 0x18, {0x1A, 0, 0x80}, "L", kI32, {0, 0x80, 0xFF, 0xFF}},
+      {"int32 4 bytes", 0x18, {0x1B, 0x78, 0x56, 0x34, 0x12}, "L", kI32, {0x78, 0x56, 0x34, 0x12}},
+      {"int64 zero", 0x20, {0x20}, "Q", kI64, Bytes(8, 0)},
+      {"int64 1 byte", 0x20, {0x21, 0xFF}, "Q", kI64, Bytes(8, 0xFF)},
+      {"int64 2 bytes", 0x20, {0x22, 1, 2}, "Q", kI64, {1, 2, 0, 0, 0, 0, 0, 0}},
+      {"int64 4 bytes neg", 0x20, {0x23, 0, 0, 0, 0x80}, "Q", kI64, Le64(0xFFFFFFFF80000000ull)},
+      {"int64 8 bytes", 0x20, Cat({{0x24}, eight}), "Q", kI64, eight},
+      {"currency", 0x24, Cat({{0x24}, eight}), "Q", kCur, eight},
+      {"currency zero", 0x24, {0x20}, "Q", kCur, Bytes(8, 0)},
+      {"float", 0x28, {0x28, 0, 0, 0x80, 0x3F}, "D", kF32, {0, 0, 0x80, 0x3F}},
+      {"float zero", 0x28, {0x2A}, "D", kF32, Bytes(4, 0)},
+      {"double", 0x30, Cat({{0x30}, eight}), "D", kF64, eight},
+      {"double zero", 0x30, {0x32}, "D", kF64, Bytes(8, 0)},
+      {"app-time", 0x34, Cat({{0x30}, eight}), "D", kF64, eight},
+      {"time", 0x38, Cat({{0x38}, eight}), "T", kI64, eight},
+      {"time, short form kept unread", 0x38, {0x39, 1, 2, 3, 4}, "T", kBin, {1, 2, 3, 4}, kUnknown},
+      {"guid", 0x40, Cat({{0x40}, kGuid}), "G", kGid, kGuid},
+      {"string empty", 0x48, {0x48}, "S", kTxt, {}},
+      {"string 8-bit, u8 length", 0x48, {0x4D, 3, 'a', 'b', 0xE9}, "S", kTxt, Text("ab\xC3\xA9")},
+      {"string 8-bit, u16 length", 0x48, {0x4E, 2, 0, 'h', 'i'}, "S", kTxt, Text("hi")},
+      {"string UTF-16, u8 length", 0x48, {0x49, 4, 0xAC, 0x20, 'x', 0}, "S", kTxt, Text(kEuroX)},
+      {"string UTF-16, u16 length", 0x48, {0x4A, 2, 0, 'y', 0}, "S", kTxt, Text("y")},
+      {"binary empty", 0x50, {0x50}, "N", kBin, {}},
+      {"binary, u8 length", 0x50, {0x51, 2, 0xAA, 0xBB}, "N", kBin, {0xAA, 0xBB}},
+      {"binary, u16 length", 0x50, {0x52, 1, 0, 0xCC}, "N", kBin, {0xCC}},
+      {"multi int16 u8 n", 0x90, {0x91, 2, 1, 0, 2, 0}, "MI", kBin, {1, 0, 2, 0}, kValue, 2},
+      {"multi int32 u16 n", 0x98, {0x9A, 1, 0, 7, 0, 0, 0}, "ML", kBin, {7, 0, 0, 0}, kValue, 1},
+      {"multi time, none", 0xB8, {0xB9, 0}, "MT", kBin, {}, kValue, 0},
+      {"multi guid", 0xC0, Cat({{0xC1, 1}, kGuid}), "MG", kBin, kGuid, kValue, 1},
+      {"multi string, mixed", 0xC8, {0xC9, 3, 0x4D, 1, 'a', 0x48, 0x49, 2, 'b', 0}, "MS", kTxt,
+       Text("a;;b"), kValue, 3},
+      {"multi binary", 0xD0, {0xD2, 2, 0, 0x51, 1, 0xAA, 0x50}, "MN", kBin, {}, kValue, 2},
+      {"deleted", 0x18, {0x00}, "L", kI32, {}, BlobValueState::kDeleted},
   };
+  // clang-format on
   return cases;
 }
 
 TEST(RealPropertyBlobTest, EveryEncodingDecodes) {
   for (const EncodingCase& c : EncodingCases()) {
     SCOPED_TRACE(c.what);
-    const Bytes blob = Blob({{c.type, 0x1234}}, c.encoded);
+    const Bytes blob = ServerBlob({{c.type, 0x1234}}, c.encoded);
     ASSERT_TRUE(IsRealLayout(blob));
     const RealBlob parsed = ParseRealBlob(blob);
     EXPECT_TRUE(parsed.complete) << parsed.problem;
     ASSERT_EQ(parsed.entries.size(), 1u);
     const BlobEntry& e = parsed.entries[0];
-    EXPECT_EQ(e.name, c.name);
+    EXPECT_EQ(e.name, c.prefix + std::string("1234"));
     EXPECT_EQ(e.id, 0x1234);
     EXPECT_EQ(e.state, c.state);
     if (c.state == BlobValueState::kDeleted) continue;
@@ -207,13 +118,14 @@ TEST(RealPropertyBlobTest, EveryEncodingDecodes) {
 // All encodings in one blob, cut at every length: never a read outside the
 // cut, and what comes out is a prefix of the whole.
 TEST(RealPropertyBlobTest, TruncationGivesAPrefix) {
-  std::vector<Property> props;
+  std::vector<test_support::BlobProperty> props;
   Bytes values;
   for (size_t i = 0; i < EncodingCases().size(); ++i) {
     props.push_back({EncodingCases()[i].type, uint16_t(0x100 + i)});
-    Append(&values, EncodingCases()[i].encoded);
+    values.insert(values.end(), EncodingCases()[i].encoded.begin(),
+                  EncodingCases()[i].encoded.end());
   }
-  const Bytes blob = Blob(props, values);
+  const Bytes blob = ServerBlob(props, values);
   const RealBlob whole = ParseRealBlob(blob);
   ASSERT_TRUE(whole.complete) << whole.problem;
   ASSERT_EQ(whole.entries.size(), props.size());
@@ -234,18 +146,10 @@ TEST(RealPropertyBlobTest, TruncationGivesAPrefix) {
 TEST(RealPropertyBlobTest, NearAndFarValues) {
   // Header 12 + 2 entries 6 = 18; two references of 13 bytes end at 44.
   constexpr uint32_t kNearArea = 44;
-  Bytes values = {0x78};
-  AppendU16(&values, 0);
-  AppendU32(&values, kNearArea);
-  AppendU16(&values, 0x48);
-  AppendU32(&values, 7);
-  values.push_back(0x7A);
-  AppendU16(&values, 3);  // slot
-  AppendU32(&values, 5);  // size hint
-  AppendU16(&values, 0x50);
-  AppendU32(&values, 7);
-  Append(&values, {0x4D, 5, 'h', 'e', 'l', 'l', 'o'});
-  const Bytes blob = Blob({{0x48, 0x37}, {0x50, 0x1000}}, values, kWithNearArea, kNearArea);
+  const Bytes values = Cat({NearRef(kNearArea, 0x48, 7),
+                            test_support::FarRef(3, 5, 0x50, 7),
+                            {0x4D, 5, 'h', 'e', 'l', 'l', 'o'}});
+  const Bytes blob = ServerBlob({{0x48, 0x37}, {0x50, 0x1000}}, values, kWithNearArea, kNearArea);
   ASSERT_EQ(blob.size(), kNearArea + 7);
 
   const RealBlob parsed = ParseRealBlob(blob);
@@ -276,32 +180,30 @@ struct DamageCase {
 };
 
 Bytes WithCount(Bytes blob, uint16_t count) {
-  blob[6] = uint8_t(count);
-  blob[7] = uint8_t(count >> 8);
+  StoreU16LE(blob.data() + 6, count);
   return blob;
+}
+
+// A bool, then an entry of `type` whose value is `value`.
+Bytes AfterBool(uint8_t type, const Bytes& value) {
+  return ServerBlob({{0x08, 1}, {type, 2}}, Cat({{0x09}, value}));
 }
 
 // A bool, then a string whose near value lies at `offset`.
 Bytes NearBlob(uint32_t near_area, uint32_t offset, uint32_t length) {
-  Bytes values = {0x09, 0x78};
-  AppendU16(&values, 0);
-  AppendU32(&values, offset);
-  AppendU16(&values, 0x48);
-  AppendU32(&values, length);
-  Append(&values, {0x4D, 1, 'z'});
-  return Blob({{0x08, 1}, {0x48, 2}}, values, kWithNearArea, near_area);
+  const Bytes values = Cat({{0x09}, NearRef(offset, 0x48, length), {0x4D, 1, 'z'}});
+  return ServerBlob({{0x08, 1}, {0x48, 2}}, values, kWithNearArea, near_area);
 }
 
 TEST(RealPropertyBlobTest, DamageStopsBeforeTheBadEntry) {
   const std::vector<DamageCase> cases = {
-      {"count larger than the entry table", WithCount(Blob({{0x08, 1}}, {0x09}), 0xFFFF), 0},
-      {"count one more than the values", WithCount(Blob({{0x08, 1}, {0x08, 2}}, {0x09, 0x08}), 3),
-       0},
-      {"element count past the end", Blob({{0x08, 1}, {0x98, 2}}, {0x09, 0x9A, 0xFF, 0xFF, 1}), 1},
-      {"string length past the end", Blob({{0x08, 1}, {0x48, 2}}, {0x09, 0x4E, 0xFF, 0xFF}), 1},
-      {"unknown type", Blob({{0x08, 1}, {0x0C, 2}}, {0x09, 0x0C}), 1},
-      {"encoding of another type", Blob({{0x08, 1}, {0x18, 2}}, {0x09, 0x38}), 1},
-      {"bytes after the last value", Blob({{0x08, 1}}, {0x09, 0x00}), 1},
+      {"count larger than the entry table", WithCount(ServerBlob({{0x08, 1}}, {0x09}), 0xFFFF), 0},
+      {"count one more than the values", WithCount(AfterBool(0x08, {0x08}), 3), 0},
+      {"element count past the end", AfterBool(0x98, {0x9A, 0xFF, 0xFF, 1}), 1},
+      {"string length past the end", AfterBool(0x48, {0x4E, 0xFF, 0xFF}), 1},
+      {"unknown type", AfterBool(0x0C, {0x0C}), 1},
+      {"encoding of another type", AfterBool(0x18, {0x38}), 1},
+      {"bytes after the last value", ServerBlob({{0x08, 1}}, {0x09, 0x00}), 1},
       {"near area before the entries", NearBlob(4, 32, 3), 0},
       {"near area past the end", NearBlob(1000, 32, 3), 0},
       {"near value inside the inline values", NearBlob(32, 20, 3), 1},

@@ -8,8 +8,13 @@
 #include <random>
 #include <string>
 
+#include "store/store_test_support.h"
+
 namespace tarnwell::store {
 namespace {
+
+using test_support::Cat;
+using test_support::Le32;
 
 // Two bodies as Outlook stores them, with the text they decode to. The
 // second one ends on a reference that reads past the write position.
@@ -51,12 +56,8 @@ class StreamBuilder {
   }
   // The whole value: a compressed header (CRC zero) and the stream.
   Bytes Value(uint32_t raw_size) const {
-    Bytes value(kRtfHeaderSize);
-    StoreU32LE(value.data(), uint32_t(stream_.size() + 12));
-    StoreU32LE(value.data() + 4, raw_size);
-    StoreU32LE(value.data() + 8, kRtfCompressed);
-    value.insert(value.end(), stream_.begin(), stream_.end());
-    return value;
+    return Cat({Le32(uint32_t(stream_.size() + 12)), Le32(raw_size), Le32(kRtfCompressed), Le32(0),
+                stream_});
   }
 
  private:
@@ -178,11 +179,8 @@ TEST(RtfDecompressorTest, ReferencesRepeatAcrossTheWritePositionAndTheRingEnd) {
 
 TEST(RtfDecompressorTest, StoredValuesOnlyInTheSoundMode) {
   const std::string raw = "{\\rtf1\\ansi\\pard stored}";
-  Bytes value(kRtfHeaderSize);
-  StoreU32LE(value.data(), uint32_t(raw.size() + 12));
-  StoreU32LE(value.data() + 4, uint32_t(raw.size()));
-  StoreU32LE(value.data() + 8, kRtfUncompressed);
-  value.insert(value.end(), raw.begin(), raw.end());
+  const Bytes value = Cat({Le32(uint32_t(raw.size() + 12)), Le32(uint32_t(raw.size())),
+                           Le32(kRtfUncompressed), Le32(0), Bytes(raw.begin(), raw.end())});
 
   auto plain = DecompressRtf(value);  // read as tokens: text, but not the stored text
   ASSERT_TRUE(plain.has_value());

@@ -14,14 +14,6 @@ TEST(TypedBinaryTest, ByteOrdersOfEachWidth) {
   EXPECT_EQ(ReadTypedU32(Bytes{0x12, 0x34, 0x56, 0x78}, ByteOrder::kBig, &u32), 1);
   EXPECT_EQ(u32, 0x12345678u);
 
-  // A legacy binary time: high half first, each half most significant first.
-  uint64_t t = 0;
-  ASSERT_EQ(ReadTypedFileTime(kEight, ByteOrder::kBig, &t), 1);
-  EXPECT_EQ(uint32_t(t >> 32), 0x01D42A5Bu);
-  EXPECT_EQ(uint32_t(t), 0x8C3E0000u);
-  ASSERT_EQ(ReadTypedU64(kEight, ByteOrder::kLittle, &t), 1);
-  EXPECT_EQ(t, 0x00003E8C5B2AD401ull);
-
   const Bytes guid_bytes = {0x33, 0x22, 0x11, 0x00, 0x55, 0x44, 0x77, 0x66,
                             0x88, 0x99, 0xAA, 0xBB, 0xCC, 0xDD, 0xEE, 0xFF};
   Guid g;
@@ -29,6 +21,11 @@ TEST(TypedBinaryTest, ByteOrdersOfEachWidth) {
   EXPECT_EQ(GuidText(g), "{00112233-4455-6677-8899-AABBCCDDEEFF}");
   ASSERT_EQ(ReadTypedGuid(guid_bytes, ByteOrder::kBig, &g), 1);
   EXPECT_EQ(GuidText(g), "{33221100-5544-7766-8899-AABBCCDDEEFF}");
+
+  // Folder ids as text: lower case, no leading zeros.
+  EXPECT_EQ(HexText(0x0001000000000A3Full), "1000000000a3f");
+  EXPECT_EQ(HexText(0), "0");
+  EXPECT_EQ(HexText(~0ull), "ffffffffffffffff");
 }
 
 TEST(TypedBinaryTest, WrongLengthIsRejectedAndLeavesOutputAlone) {
@@ -57,11 +54,8 @@ TEST(TypedBinaryTest, WrongLengthIsRejectedAndLeavesOutputAlone) {
   }
 }
 
-TEST(TypedBinaryTest, NameDecidesTheKind) {
-  struct Case {
-    const char* name;
-    TypedKind kind;
-  } cases[] = {
+TEST(TypedBinaryTest, NameDecidesTheKindAndTheDecode) {
+  const std::pair<const char*, TypedKind> kinds[] = {
       {"Tf", TypedKind::kFileTime},
       {"T3007", TypedKind::kFileTime},
       {"T123456", TypedKind::kFileTime},
@@ -73,14 +67,13 @@ TEST(TypedBinaryTest, NameDecidesTheKind) {
       {"", TypedKind::kNone},
       {"MN81a9", TypedKind::kNone},
   };
-  for (const Case& c : cases) EXPECT_EQ(TypedKindOfName(c.name), c.kind) << c.name;
-}
+  for (const auto& [name, kind] : kinds) EXPECT_EQ(TypedKindOfName(name), kind) << name;
 
-TEST(TypedBinaryTest, DecodeByName) {
   TypedValue v;
   EXPECT_EQ(DecodeTypedBinary("Q6748", kEight, ByteOrder::kLittle, &v), 1);
   EXPECT_EQ(v.kind, TypedKind::kInteger64);
   EXPECT_EQ(v.value, 0x00003E8C5B2AD401ull);
+  // A legacy binary time: high half first, each half most significant first.
   EXPECT_EQ(DecodeTypedBinary("T3007", kEight, ByteOrder::kBig, &v), 1);
   EXPECT_EQ(v.kind, TypedKind::kFileTime);
   EXPECT_EQ(v.value, 0x01D42A5B8C3E0000ull);
@@ -88,12 +81,6 @@ TEST(TypedBinaryTest, DecodeByName) {
   EXPECT_EQ(DecodeTypedBinary("Q6748", Bytes{}, ByteOrder::kLittle, &v), 0);
   EXPECT_EQ(DecodeTypedBinary("N67b0", kEight, ByteOrder::kLittle, &v), 0);
   EXPECT_EQ(DecodeTypedBinary("Q6748", Bytes(9, 1), ByteOrder::kLittle, &v), -1);
-}
-
-TEST(TypedBinaryTest, HexTextOfFolderIds) {
-  EXPECT_EQ(HexText(0x0001000000000A3Full), "1000000000a3f");
-  EXPECT_EQ(HexText(0), "0");
-  EXPECT_EQ(HexText(~0ull), "ffffffffffffffff");
 }
 
 }  // namespace
