@@ -2,45 +2,24 @@
 // esedbexport from Debian's libesedb-utils), an ESE reader written without
 // any of our code.
 #include <gtest/gtest.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <cinttypes>
 #include <cstdio>
-#include <cstdlib>
 #include <cstring>
 #include <ctime>
-#include <filesystem>
-#include <fstream>
-#include <sstream>
 #include <string>
 
+#include "base/text.h"
 #include "testing/ese_writer.h"
 #include "testing/forge_catalog.h"
 #include "testing/forge_record.h"
 #include "testing/forge_sample.h"
+#include "testing/forge_test_support.h"
 #include "testing/forge_value.h"
 
 namespace tarnwell::forge {
 namespace {
-
-namespace fs = std::filesystem;
-
-bool HaveTool(const char* name) {
-  std::string cmd = std::string("command -v ") + name + " >/dev/null 2>&1";
-  return std::system(cmd.c_str()) == 0;
-}
-
-int RunTool(const std::string& cmd, const std::string& log) {
-  return std::system((cmd + " >" + log + " 2>&1 </dev/null").c_str());
-}
-
-std::string ReadText(const fs::path& path) {
-  std::ifstream in(path, std::ios::binary);
-  std::stringstream ss;
-  ss << in.rdbuf();
-  return ss.str();
-}
 
 std::string Hex(const Bytes& b) { return ToHex(ByteView(b)); }
 
@@ -62,24 +41,6 @@ std::string FiletimeText(uint64_t filetime) {
   char nanos[16];
   std::snprintf(nanos, sizeof nanos, ".%09" PRIu64, (filetime % kTicksPerSecond) * 100);
   return std::string(date) + nanos;
-}
-
-std::string Utf16ToUtf8(const Bytes& b) {
-  std::string out;
-  for (size_t i = 0; i + 1 < b.size(); i += 2) {
-    uint16_t c = LoadU16LE(&b[i]);
-    if (c < 0x80) {
-      out += char(c);
-    } else if (c < 0x800) {
-      out += char(0xC0 | (c >> 6));
-      out += char(0x80 | (c & 0x3F));
-    } else {
-      out += char(0xE0 | (c >> 12));
-      out += char(0x80 | ((c >> 6) & 0x3F));
-      out += char(0x80 | (c & 0x3F));
-    }
-  }
-  return out;
 }
 
 // How esedbexport 20181229 prints a value of each column type.
@@ -115,7 +76,8 @@ std::string ExportText(const ColumnLayout& column, const Bytes& v) {
       return FiletimeText(Le(v));
     case kColumnText:
     case kColumnLongText:
-      return column.codepage == 1200 ? Utf16ToUtf8(v) : std::string(v.begin(), v.end());
+      return column.codepage == kCodePageUtf16LE ? Utf16LEToUtf8(ByteView(v))
+                                                 : std::string(v.begin(), v.end());
     default:
       return Hex(v);
   }
@@ -150,24 +112,27 @@ struct ExportCase {
   uint32_t children_per_branch;
 };
 
-class EsedbExportTest : public ::testing::TestWithParam<ExportCase> {
+template <typename Case>
+class LibesedbTest : public ::testing::TestWithParam<Case> {
  protected:
   void SetUp() override {
     if (!HaveTool("esedbexport") || !HaveTool("esedbinfo")) {
       GTEST_SKIP() << "esedbinfo/esedbexport (Debian libesedb-utils) not installed";
     }
-    const ExportCase& c = GetParam();
-    dir_ = fs::path(::testing::TempDir()) /
-           ("forge_esedb_" + std::to_string(getpid()) + "_" + std::to_string(c.page_size) + "_" +
-            std::to_string(c.revision) + "_" + std::to_string(c.rows));
-    fs::remove_all(dir_);
-    fs::create_directories(dir_);
   }
-  void TearDown() override {
-    if (!dir_.empty() && !HasFailure()) fs::remove_all(dir_);
+  // Exports every table of `edb` into dir_/out.export.
+  void Export(const std::string& edb) {
+    ASSERT_EQ(RunTool("esedbexport -t '" + dir_ / "out" + "' '" + edb + "'", dir_ / "export.log"),
+              0)
+        << ReadFileText(dir_ / "export.log");
   }
-  fs::path dir_;
+  std::string Exported(const std::string& file) {
+    return ReadFileText(dir_ / ("out.export/" + file));
+  }
+  ScratchDir dir_{"forge_esedb"};
 };
+
+using EsedbExportTest = LibesedbTest<ExportCase>;
 
 TEST_P(EsedbExportTest, LibesedbExportsWhatWasWritten) {
   const ExportCase& c = GetParam();
@@ -188,57 +153,42 @@ TEST_P(EsedbExportTest, LibesedbExportsWhatWasWritten) {
         std::erase_if(row.cells, [](const Cell& cell) { return cell.column_id == 257; });
     }
   }
-  const fs::path edb = dir_ / "sample.edb";
+  const std::string edb = dir_ / "sample.edb";
   Manifest manifest;
-  ASSERT_TRUE(WriteDatabase(layout, edb.string(), &manifest).ok());
+  ASSERT_TRUE(WriteDatabase(layout, edb, &manifest).ok());
   if (c.rows_per_leaf) {
     EXPECT_GT(manifest.tables[0].branch_pages.size(), 1u) << "want several branch levels";
   }
 
-  const fs::path info_log = dir_ / "esedbinfo.log";
-  ASSERT_EQ(RunTool("esedbinfo '" + edb.string() + "'", info_log.string()), 0)
-      << ReadText(info_log);
-  const std::string info = ReadText(info_log);
+  ASSERT_EQ(RunTool("esedbinfo '" + edb + "'", dir_ / "info.log"), 0)
+      << ReadFileText(dir_ / "info.log");
+  const std::string info = ReadFileText(dir_ / "info.log");
   EXPECT_NE(info.find("Page size:\t\t" + std::to_string(c.page_size) + " bytes"), std::string::npos)
       << info;
   EXPECT_NE(info.find("Number of tables:\t" + std::to_string(layout.tables.size() + 2)),
             std::string::npos)
       << info;
 
-  const fs::path prefix = dir_ / "out";
-  const fs::path export_log = dir_ / "esedbexport.log";
-  ASSERT_EQ(RunTool("esedbexport -t '" + prefix.string() + "' '" + edb.string() + "'",
-                    export_log.string()),
-            0)
-      << ReadText(export_log);
-  const fs::path exported = dir_ / "out.export";
+  Export(edb);
 
   // Tables come out in object id order: the catalog and its shadow first.
   for (size_t t = 0; t < layout.tables.size(); ++t) {
-    const fs::path file = exported / (layout.tables[t].name + "." + std::to_string(t + 2));
-    ASSERT_TRUE(fs::exists(file)) << file;
-    EXPECT_EQ(ReadText(file), ExpectedExport(layout.tables[t])) << layout.tables[t].name;
+    EXPECT_EQ(Exported(layout.tables[t].name + "." + std::to_string(t + 2)),
+              ExpectedExport(layout.tables[t]))
+        << layout.tables[t].name;
   }
 
   // The catalog lists every table and column by name, and the shadow agrees.
-  const std::string catalog = ReadText(exported / "MSysObjects.0");
-  EXPECT_EQ(catalog, ReadText(exported / "MSysObjectsShadow.1"));
-  auto split = [](const std::string& text) {
-    std::vector<std::string> fields;
-    std::istringstream in(text);
-    std::string field;
-    while (std::getline(in, field, '\t')) fields.push_back(field);
-    return fields;
-  };
-  std::istringstream lines(catalog);
-  std::string line;
-  std::getline(lines, line);
-  const std::vector<std::string> header = split(line);
+  const std::string catalog = Exported("MSysObjects.0");
+  EXPECT_EQ(catalog, Exported("MSysObjectsShadow.1"));
+  const std::vector<std::string> lines = SplitText(catalog, '\n');
+  ASSERT_FALSE(lines.empty());
+  const std::vector<std::string> header = SplitText(lines[0], '\t');
   const size_t name_column = std::find(header.begin(), header.end(), "Name") - header.begin();
-  ASSERT_LT(name_column, header.size()) << line;
+  ASSERT_LT(name_column, header.size()) << lines[0];
   std::vector<std::string> names;
-  while (std::getline(lines, line)) {
-    std::vector<std::string> fields = split(line);
+  for (size_t i = 1; i < lines.size(); ++i) {
+    const std::vector<std::string> fields = SplitText(lines[i], '\t');
     names.push_back(name_column < fields.size() ? fields[name_column] : "");
   }
   std::vector<std::string> expected = {"MSysObjects"};
@@ -279,20 +229,7 @@ struct LongValueExportCase {
   uint32_t revision;
 };
 
-class EsedbExportLongValueTest : public ::testing::TestWithParam<LongValueExportCase> {
- protected:
-  void SetUp() override {
-    if (!HaveTool("esedbexport")) GTEST_SKIP() << "esedbexport (libesedb-utils) not installed";
-    dir_ = fs::path(::testing::TempDir()) / ("forge_esedb_lv_" + std::to_string(getpid()) + "_" +
-                                             std::to_string(GetParam().page_size));
-    fs::remove_all(dir_);
-    fs::create_directories(dir_);
-  }
-  void TearDown() override {
-    if (!dir_.empty() && !HasFailure()) fs::remove_all(dir_);
-  }
-  fs::path dir_;
-};
+using EsedbExportLongValueTest = LibesedbTest<LongValueExportCase>;
 
 TEST_P(EsedbExportLongValueTest, LibesedbExportsTheLongValuesBytes) {
   const LongValueExportCase& c = GetParam();
@@ -318,23 +255,19 @@ TEST_P(EsedbExportLongValueTest, LibesedbExportsTheLongValuesBytes) {
     table.long_values.push_back(std::move(lv));
     layout.tables.push_back(std::move(table));
   }
-  const fs::path edb = dir_ / "lv.edb";
+  const std::string edb = dir_ / "lv.edb";
   Manifest manifest;
-  ASSERT_TRUE(WriteDatabase(layout, edb.string(), &manifest).ok());
+  ASSERT_TRUE(WriteDatabase(layout, edb, &manifest).ok());
   for (const TableManifest& m : manifest.tables) {
     if (m.name.rfind("Attachments", 0) != 0) continue;
     EXPECT_EQ(m.long_value_leaf_pages.size(), 2u) << "the layout libesedb reads";
   }
 
-  const fs::path prefix = dir_ / "out";
-  const fs::path log = dir_ / "esedbexport.log";
-  ASSERT_EQ(
-      RunTool("esedbexport -t '" + prefix.string() + "' '" + edb.string() + "'", log.string()), 0)
-      << ReadText(log);
+  Export(edb);
   for (size_t t = 0; t < layout.tables.size(); ++t) {
-    const fs::path file =
-        dir_ / "out.export" / (layout.tables[t].name + "." + std::to_string(t + 2));
-    EXPECT_EQ(ReadText(file), "Id\tData\n1\t" + Hex(values[t]) + "\n2\tcafe\n") << file;
+    EXPECT_EQ(Exported(layout.tables[t].name + "." + std::to_string(t + 2)),
+              "Id\tData\n1\t" + Hex(values[t]) + "\n2\tcafe\n")
+        << layout.tables[t].name;
   }
 }
 

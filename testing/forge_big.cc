@@ -1,21 +1,15 @@
 #include "testing/forge_big.h"
 
-#include <fcntl.h>
-#include <unistd.h>
-
 #include <algorithm>
-#include <cerrno>
 #include <cstring>
 #include <iterator>
-#include <optional>
 #include <string>
 #include <vector>
 
 #include "testing/forge_database.h"
-#include "testing/forge_long_value.h"
 #include "testing/forge_record.h"
 #include "testing/forge_sample.h"
-#include "testing/forge_tree.h"
+#include "testing/forge_stream.h"
 #include "testing/forge_value.h"
 
 namespace tarnwell::forge {
@@ -28,7 +22,6 @@ constexpr double kOleDate2013 = 41440.0;   // 2013-06-15
 constexpr double kOleDateStep = 1.0 / 24;  // an hour
 constexpr uint32_t kFolders = 24;
 constexpr uint32_t kMailboxes = 6;
-constexpr size_t kWriteBuffer = 4 << 20;  // contiguous pages gathered per write
 constexpr uint64_t kMiB = 1 << 20;
 // Every n-th message gets an attachment; bodies above the limit go to the
 // long-value tree, the others stay in the record.
@@ -37,44 +30,6 @@ constexpr size_t kInlineBodyLimit = 1024;
 constexpr size_t kMaxBody = 6000;
 constexpr size_t kMinAttachment = 2000;
 constexpr size_t kMaxAttachment = 60000;
-
-// Writes pages where they belong in the file, gathering runs of consecutive
-// pages into one write.
-class FileSink : public PageSink {
- public:
-  FileSink(int fd, uint32_t page_size) : fd_(fd), page_size_(page_size) {}
-  Status Put(uint32_t page_number, Bytes image) override {
-    if (!buffer_.empty() && page_number != first_ + buffer_.size() / page_size_) {
-      Status s = Flush();
-      if (!s.ok()) return s;
-    }
-    if (buffer_.empty()) first_ = page_number;
-    buffer_.insert(buffer_.end(), image.begin(), image.end());
-    return buffer_.size() >= kWriteBuffer ? Flush() : Status::Ok();
-  }
-  Status Flush() {
-    if (buffer_.empty()) return Status::Ok();
-    Status s = WriteAt(off_t(first_ + 1) * page_size_, buffer_.data(), buffer_.size());
-    buffer_.clear();
-    return s;
-  }
-  Status WriteAt(off_t offset, const uint8_t* data, size_t size) {
-    while (size > 0) {
-      ssize_t n = pwrite(fd_, data, size, offset);
-      if (n <= 0) return Status::IoError(std::string("write failed: ") + std::strerror(errno));
-      data += n;
-      size -= size_t(n);
-      offset += n;
-    }
-    return Status::Ok();
-  }
-
- private:
-  int fd_;
-  uint32_t page_size_;
-  uint32_t first_ = 0;
-  Bytes buffer_;
-};
 
 // splitmix64: fast, and the same sequence for the same seed everywhere.
 class Random {
@@ -128,19 +83,12 @@ Bytes OrdinalKey(uint64_t ordinal) {
 }
 
 Status WriteSmallTable(DatabaseWriter* db, const TableLayout& table) {
-  TreeOptions options = db->NewTree(0);
-  TreeWriter writer(db->format(), options, db->allocator(), db->sink());
+  StreamTable writer(db, table.name, table.columns, {});
   for (size_t i = 0; i < table.rows.size(); ++i) {
-    TreeEntry e;
-    e.key = OrdinalKey(i + 1);
-    Status s = EncodeRecord(table.columns, table.rows[i].cells, db->layout(), &e.data);
-    if (s.ok()) s = writer.Add(std::move(e));
+    Status s = writer.AddRow(OrdinalKey(i + 1), table.rows[i].cells);
     if (!s.ok()) return s;
   }
-  TreeLayout layout;
-  Status s = writer.Finish(&layout);
-  if (s.ok()) db->AddTable(table.name, table.columns, options, layout, nullptr, nullptr);
-  return s;
+  return writer.Finish();
 }
 
 TableLayout FoldersTable() {
@@ -197,97 +145,60 @@ Status WriteBigDatabase(const BigOptions& options, const std::string& path, Mani
   layout.page_size = options.page_size;
   layout.format_revision =
       options.revision ? options.revision : DefaultRevisionFor(options.page_size);
-  const int fd = open(path.c_str(), O_CREAT | O_TRUNC | O_WRONLY, 0644);
-  if (fd < 0) return Status::IoError("cannot create " + path);
-  FileSink sink(fd, layout.page_size);
-  DatabaseWriter db(layout, &sink);
-  Status s = db.status();
+  DatabaseFile file(layout.page_size);
+  Status s = file.Create(path);
+  if (!s.ok()) return s;
   BigResult local;
-  auto finish = [&](Status st) {
-    if (close(fd) != 0 && st.ok()) st = Status::IoError("cannot write " + path);
-    if (result) *result = local;
-    return st;
-  };
-  if (!s.ok()) return finish(s);
-  for (const TableLayout& t : {MailboxesTable(), FoldersTable()}) {
-    s = WriteSmallTable(&db, t);
-    if (!s.ok()) return finish(s);
-  }
-
-  const std::vector<ColumnLayout> columns = MessageColumns();
-  const TreeOptions table_options = db.NewTree(0);
-  const TreeOptions lv_options = db.NewTree(kPageFlagLongValue);
-  TreeWriter rows(db.format(), table_options, db.allocator(), db.sink());
-  TreeWriter lvs(db.format(), lv_options, db.allocator(), db.sink());
-  const uint32_t chunk_size = DefaultLongValueChunkSize(db.format(), kLongValueIdSize);
-  const uint64_t target_pages = options.size_mib * kMiB / layout.page_size;
-  Random rng(options.seed);
-  uint64_t next_lv = 1;
-  std::vector<TreeEntry> lv_entries;
-  auto add_long_value = [&](Bytes data) -> Status {
-    LongValueLayout v;
-    v.id = next_lv++;
-    v.data = std::move(data);
-    lv_entries.clear();
-    Status st =
-        AppendLongValueEntries(v, kLongValueIdSize, chunk_size, std::nullopt, &lv_entries, nullptr);
-    for (TreeEntry& e : lv_entries) {
-      if (!st.ok()) break;
-      st = lvs.Add(std::move(e));
+  s = [&]() -> Status {
+    DatabaseWriter db(layout, &file);
+    if (!db.status().ok()) return db.status();
+    for (const TableLayout& t : {MailboxesTable(), FoldersTable()}) {
+      Status st = WriteSmallTable(&db, t);
+      if (!st.ok()) return st;
     }
-    ++local.long_values;
-    return st;
-  };
-
-  for (uint64_t id = 1; db.allocator()->last_allocated() < target_pages; ++id) {
-    std::vector<Cell> cells;
-    cells.push_back({1, LittleEndian(id, 4)});
-    cells.push_back({2, LittleEndian(rng.Below(kFolders) + 1, 4)});
-    const double received = kOleDate2013 + double(id) * kOleDateStep;
-    uint64_t received_bits;
-    std::memcpy(&received_bits, &received, sizeof received_bits);
-    cells.push_back({3, LittleEndian(received_bits, 8)});
-    const size_t body_size = 2 * (rng.Below(kMaxBody / 2) + 1);
-    cells.push_back({4, LittleEndian(body_size, 4)});
-    cells.push_back({5, LittleEndian(rng.Next() & 0xFF, 4)});
-    cells.push_back({128, Utf16(Sentence(rng, 2 + rng.Below(6)))});
-    cells.push_back(
-        {129, Ascii("user" + std::to_string(rng.Below(kMailboxes) + 1) + "@example.org")});
-    Bytes body = BodyText(rng, body_size);
-    if (body.size() > kInlineBodyLimit) {
-      cells.push_back(SeparatedCell(256, next_lv));
-      s = add_long_value(std::move(body));
-    } else {
-      cells.push_back({256, std::move(body)});
+    StreamTable messages(&db, "Messages", MessageColumns(), {.long_values = true});
+    const uint64_t target_pages = options.size_mib * kMiB / layout.page_size;
+    Random rng(options.seed);
+    for (uint64_t id = 1; db.allocator()->last_allocated() < target_pages; ++id) {
+      std::vector<Cell> cells;
+      cells.push_back({1, LittleEndian(id, 4)});
+      cells.push_back({2, LittleEndian(rng.Below(kFolders) + 1, 4)});
+      const double received = kOleDate2013 + double(id) * kOleDateStep;
+      uint64_t received_bits;
+      std::memcpy(&received_bits, &received, sizeof received_bits);
+      cells.push_back({3, LittleEndian(received_bits, 8)});
+      const size_t body_size = 2 * (rng.Below(kMaxBody / 2) + 1);
+      cells.push_back({4, LittleEndian(body_size, 4)});
+      cells.push_back({5, LittleEndian(rng.Next() & 0xFF, 4)});
+      cells.push_back({128, Utf16(Sentence(rng, 2 + rng.Below(6)))});
+      cells.push_back(
+          {129, Ascii("user" + std::to_string(rng.Below(kMailboxes) + 1) + "@example.org")});
+      Bytes body = BodyText(rng, body_size);
+      Status st;
+      uint64_t lv = 0;
+      if (body.size() > kInlineBodyLimit) {
+        st = messages.AddLongValue(std::move(body), Compression::kNone, &lv);
+        cells.push_back(SeparatedCell(256, lv));
+      } else {
+        cells.push_back({256, std::move(body)});
+      }
+      if (st.ok() && id % kAttachmentEvery == 0) {
+        st = messages.AddLongValue(
+            Attachment(rng, kMinAttachment + rng.Below(kMaxAttachment - kMinAttachment)),
+            Compression::kNone, &lv);
+        cells.push_back(SeparatedCell(257, lv));
+      }
+      if (st.ok()) st = messages.AddRow(OrdinalKey(id), cells);
+      local.rows = messages.rows();
+      local.long_values = messages.long_values();
+      if (!st.ok()) return st;
     }
-    if (s.ok() && id % kAttachmentEvery == 0) {
-      cells.push_back(SeparatedCell(257, next_lv));
-      s = add_long_value(
-          Attachment(rng, kMinAttachment + rng.Below(kMaxAttachment - kMinAttachment)));
-    }
-    TreeEntry row;
-    row.key = OrdinalKey(id);
-    if (s.ok()) s = EncodeRecord(columns, cells, db.layout(), &row.data);
-    if (s.ok()) s = rows.Add(std::move(row));
-    if (!s.ok()) return finish(s);
-    ++local.rows;
-  }
-  TreeLayout table_layout, lv_layout;
-  s = rows.Finish(&table_layout);
-  if (s.ok()) s = lvs.Finish(&lv_layout);
-  if (!s.ok()) return finish(s);
-  db.AddTable("Messages", columns, table_options, table_layout, &lv_options, &lv_layout);
-
-  Bytes header;
-  s = db.Finish(&header, manifest);
-  if (s.ok()) s = sink.Flush();
-  if (s.ok()) s = sink.WriteAt(0, header.data(), header.size());
-  if (s.ok()) s = sink.WriteAt(layout.page_size, header.data(), header.size());
-  local.file_size = uint64_t(db.total_pages() + 2) * layout.page_size;
-  if (s.ok() && ftruncate(fd, off_t(local.file_size)) != 0) {
-    s = Status::IoError("cannot size " + path);
-  }
-  return finish(s);
+    Status st = messages.Finish();
+    return st.ok() ? file.Finish(&db, manifest) : st;
+  }();
+  local.file_size = file.file_size();
+  if (result) *result = local;
+  return file.Close(s);
 }
 
 }  // namespace tarnwell::forge

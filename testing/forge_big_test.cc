@@ -3,55 +3,41 @@
 #include "testing/forge_big.h"
 
 #include <gtest/gtest.h>
-#include <unistd.h>
 
 #include <filesystem>
-#include <fstream>
-#include <iterator>
 #include <memory>
 
 #include "engine/catalog.h"
 #include "engine/column_decoder.h"
 #include "engine/edb_class.h"
+#include "testing/forge_test_support.h"
 
 namespace tarnwell::forge {
 namespace {
 
-namespace fs = std::filesystem;
 using Kind = engine::DecodedColumn::Kind;
 
 constexpr uint64_t kSizeMib = 3;
 
-std::string ReadAll(const fs::path& path) {
-  std::ifstream in(path, std::ios::binary);
-  return std::string(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
-}
-
 class ForgeBigTest : public ::testing::TestWithParam<uint32_t> {
  protected:
-  void SetUp() override {
-    dir_ = fs::path(::testing::TempDir()) /
-           ("forge_big_" + std::to_string(getpid()) + "_" + std::to_string(GetParam()));
-    fs::create_directories(dir_);
-  }
-  void TearDown() override { fs::remove_all(dir_); }
-  fs::path dir_;
+  ScratchDir dir_{"forge_big"};
 };
 
 TEST_P(ForgeBigTest, EveryMessageAndLongValueReadsBack) {
   BigOptions options;
   options.size_mib = kSizeMib;
   options.page_size = GetParam();
-  const fs::path path = dir_ / "big.edb";
+  const std::string path = dir_ / "big.edb";
   Manifest manifest;
   BigResult result;
-  ASSERT_TRUE(WriteBigDatabase(options, path.string(), &manifest, &result).ok());
-  EXPECT_EQ(fs::file_size(path), result.file_size);
+  ASSERT_TRUE(WriteBigDatabase(options, path, &manifest, &result).ok());
+  EXPECT_EQ(std::filesystem::file_size(path), result.file_size);
   EXPECT_GE(result.file_size, kSizeMib << 20);
   EXPECT_EQ(result.file_size, (manifest.total_pages + 2) * options.page_size);
 
   std::unique_ptr<engine::EdbClass> reader;
-  ASSERT_TRUE(engine::InspectDatabase(path.string(), &reader).ok());
+  ASSERT_TRUE(engine::InspectDatabase(path, &reader).ok());
   ASSERT_EQ(reader->CollectTreeRecords(engine::kCatalogRootPage), 1);
   reader->ParseCatalogRecords();
   for (const char* name : {"Mailboxes", "Folders"}) EXPECT_NE(reader->FindTable(name), nullptr);
@@ -89,13 +75,14 @@ TEST_P(ForgeBigTest, SameOptionsSameBytes) {
   BigOptions options;
   options.size_mib = 1;
   options.page_size = GetParam();
-  ASSERT_TRUE(WriteBigDatabase(options, (dir_ / "a.edb").string()).ok());
-  ASSERT_TRUE(WriteBigDatabase(options, (dir_ / "b.edb").string()).ok());
+  ASSERT_TRUE(WriteBigDatabase(options, dir_ / "a.edb").ok());
+  ASSERT_TRUE(WriteBigDatabase(options, dir_ / "b.edb").ok());
   options.seed = 2;
-  ASSERT_TRUE(WriteBigDatabase(options, (dir_ / "c.edb").string()).ok());
-  const std::string a = ReadAll(dir_ / "a.edb");
-  EXPECT_TRUE(a == ReadAll(dir_ / "b.edb"));
-  EXPECT_FALSE(a == ReadAll(dir_ / "c.edb"));
+  ASSERT_TRUE(WriteBigDatabase(options, dir_ / "c.edb").ok());
+  const std::string a = ReadFileText(dir_ / "a.edb");
+  EXPECT_TRUE(a == ReadFileText(dir_ / "b.edb"));
+  EXPECT_FALSE(a == ReadFileText(dir_ / "c.edb"));
+  EXPECT_FALSE(WriteBigDatabase(options, "/nonexistent-dir/x.edb").ok());
 }
 
 INSTANTIATE_TEST_SUITE_P(PageSizes, ForgeBigTest, ::testing::Values(4096u, 8192u, 32768u),

@@ -1,11 +1,7 @@
 #include "testing/exchange/modern_store_builder.h"
 
-#include <fcntl.h>
-#include <unistd.h>
-
 #include <algorithm>
 #include <cctype>
-#include <cerrno>
 #include <cstdio>
 #include <cstring>
 #include <iterator>
@@ -19,11 +15,10 @@
 #include "base/text.h"
 #include "testing/exchange/property_blob_encoder.h"
 #include "testing/exchange/real_blob_encoder.h"
-#include "testing/exchange/rtf_literal_encoder.h"
+#include "testing/exchange/store_tables.h"
 #include "testing/forge_database.h"
-#include "testing/forge_long_value.h"
 #include "testing/forge_record.h"
-#include "testing/forge_tree.h"
+#include "testing/forge_stream.h"
 #include "testing/forge_value.h"
 
 namespace tarnwell::forge::exchange {
@@ -34,18 +29,10 @@ constexpr uint32_t kPage32K = 32768;
 constexpr uint32_t kRevision2010 = 17;
 constexpr uint32_t kRevision2013 = 20;
 constexpr uint32_t kRevisionReal = 110;
-constexpr uint64_t kFirstWideLongValueId = (uint64_t(1) << 32) + 1;
 // A catalog of this revision has records ending at fixed column 11.
 constexpr uint32_t kEarly2013CatalogRevision = 17;
 
-constexpr uint32_t kCodePageUnicode = 1200;
-constexpr uint32_t kCodePageWestern = 1252;
-constexpr uint32_t kInternetCodePageUtf8 = 65001;
-
 constexpr uint8_t kKeyPrefix = 0x7F;
-constexpr uint8_t kKeySuffix = 0x08;
-constexpr size_t kIdSize = 8;
-constexpr uint8_t kBitTrue = 1;
 constexpr uint32_t kFlagRead = 0x1;
 
 constexpr uint16_t kBodyTypePlain = 1;
@@ -69,259 +56,133 @@ constexpr uint64_t kBrokenMailbox2010 = 0x400000000D4ull;
 
 constexpr uint32_t kRecordBudgetDivisor = 2;
 constexpr uint32_t kDefaultLimitDivisor = 4;
-constexpr size_t kWriteBuffer = 4 << 20;
 constexpr size_t kLargeHtmlLines = 2500;
 
 // ---- Table schemas
 
-enum class Slot { kFixed, kVariable, kTagged };
-
-struct Column {
-  const char* name;
-  uint32_t type;
-  uint32_t codepage;
-  Slot slot;
-};
-
-class Schema {
- public:
-  void Add(const Column& c) {
-    uint32_t& next = c.slot == Slot::kFixed      ? next_fixed_
-                     : c.slot == Slot::kVariable ? next_variable_
-                                                 : next_tagged_;
-    ColumnLayout layout;
-    layout.id = next++;
-    layout.name = c.name;
-    layout.type = c.type;
-    layout.codepage = c.codepage;
-    if (c.slot == Slot::kFixed && c.type == kColumnBinary) layout.size = kIdSize;
-    columns_.push_back(layout);
-  }
-  void Seal() {
-    std::sort(columns_.begin(), columns_.end(),
-              [](const ColumnLayout& a, const ColumnLayout& b) { return a.id < b.id; });
-    for (size_t i = 0; i < columns_.size(); ++i) index_[columns_[i].name] = i;
-  }
-  const ColumnLayout* Find(const std::string& name) const {
-    auto it = index_.find(name);
-    return it == index_.end() ? nullptr : &columns_[it->second];
-  }
-  const std::vector<ColumnLayout>& columns() const { return columns_; }
-
- private:
-  std::vector<ColumnLayout> columns_;
-  std::map<std::string, size_t> index_;
-  uint32_t next_fixed_ = 1;
-  uint32_t next_variable_ = kFirstVariableColumnId;
-  uint32_t next_tagged_ = kFirstTaggedColumnId;
-};
-
-Schema MailboxSchema(int version) {
-  Schema s;
-  if (version == kExchange2013) {
-    s.Add({"MailboxNumber", kColumnLong, 0, Slot::kFixed});
-    s.Add({"DisplayName", kColumnText, kCodePageUnicode, Slot::kVariable});
-    s.Add({"MailboxOwnerDisplayName", kColumnText, kCodePageUnicode, Slot::kTagged});
-  } else {
-    s.Add({"Q6764", kColumnBinary, 0, Slot::kVariable});
-    s.Add({"S3001", kColumnText, kCodePageUnicode, Slot::kVariable});
-  }
-  s.Seal();
-  return s;
-}
-
-Schema FolderSchema(int version) {
-  Schema s;
-  const bool modern = version == kExchange2013;
-  s.Add({modern ? "FolderId" : "Q6748", kColumnBinary, 0, Slot::kVariable});
-  s.Add({modern ? "ParentFolderId" : "Q6749", kColumnBinary, 0, Slot::kVariable});
-  s.Add({modern ? "DisplayName" : "S3001", kColumnText, kCodePageUnicode, Slot::kVariable});
-  s.Add({modern ? "ContainerClass" : "S3613", kColumnText, kCodePageUnicode, Slot::kVariable});
-  s.Seal();
-  return s;
-}
-
-Schema Message2013Schema() {
-  Schema s;
-  s.Add({"MessageDocumentId", kColumnLong, 0, Slot::kFixed});
-  s.Add({"IsRead", kColumnBit, 0, Slot::kFixed});
-  s.Add({"Importance", kColumnLong, 0, Slot::kFixed});
-  s.Add({"HasAttachments", kColumnBit, 0, Slot::kFixed});
-  s.Add({"BodyType", kColumnShort, 0, Slot::kFixed});
-  s.Add({"DateCreated", kColumnDateTime, 0, Slot::kFixed});
-  s.Add({"LastModificationTime", kColumnDateTime, 0, Slot::kFixed});
-  s.Add({"DateReceived", kColumnDateTime, 0, Slot::kFixed});
-  s.Add({"MessageId", kColumnBinary, 0, Slot::kVariable});
-  s.Add({"FolderId", kColumnBinary, 0, Slot::kVariable});
-  s.Add({"MessageClass", kColumnText, kCodePageWestern, Slot::kTagged});
-  s.Add({"DisplayTo", kColumnText, kCodePageUnicode, Slot::kTagged});
-  s.Add({"SubjectPrefix", kColumnText, kCodePageUnicode, Slot::kTagged});
-  s.Add({"PropertyBlob", kColumnLongBinary, 0, Slot::kTagged});
-  s.Add({"NativeBody", kColumnLongBinary, 0, Slot::kTagged});
-  s.Seal();
-  return s;
-}
-
-Schema Attachment2013Schema() {
-  Schema s;
-  s.Add({"Inid", kColumnLongLong, 0, Slot::kFixed});
-  s.Add({"MessageDocumentId", kColumnLong, 0, Slot::kFixed});
-  s.Add({"Size", kColumnLong, 0, Slot::kFixed});
-  s.Add({"Name", kColumnText, kCodePageUnicode, Slot::kTagged});
-  s.Add({"Content", kColumnLongBinary, 0, Slot::kTagged});
-  s.Seal();
-  return s;
-}
-
-// ---- Schemas of the real layout
+using Columns = std::vector<ColumnLayout>;
 
 constexpr int kSeparatedColumns = 4;
+const char* const kSeparated[kSeparatedColumns] = {"SeparatedProperty01", "SeparatedProperty02",
+                                                   "SeparatedProperty03", "SeparatedProperty04"};
 
-Schema MailboxRealSchema() {
+// Code 5 in either layout (`real`), and code 3's "Mailbox" and "Folders-x".
+Columns MailboxSchema(bool modern, bool real) {
+  if (!modern) {
+    return Schema()
+        .Add({Variable("Q6764", kColumnBinary), Variable("S3001", kColumnText, kCodePageUnicode)})
+        .Columns();
+  }
   Schema s;
-  s.Add({"MailboxNumber", kColumnLong, 0, Slot::kFixed});
-  s.Add({"DisplayName", kColumnText, kCodePageUnicode, Slot::kVariable});
-  s.Add({"MailboxOwnerDisplayName", kColumnText, kCodePageUnicode, Slot::kTagged});
-  s.Add({"PropertyBlob", kColumnLongBinary, 0, Slot::kTagged});
-  s.Seal();
-  return s;
+  s.Add({Fixed("MailboxNumber", kColumnLong),
+         Variable("DisplayName", kColumnText, kCodePageUnicode),
+         Tagged("MailboxOwnerDisplayName", kColumnText, kCodePageUnicode)});
+  if (real) s.Add(Tagged("PropertyBlob", kColumnLongBinary));
+  return s.Columns();
 }
 
-Schema FolderRealSchema() {
+Columns FolderSchema(bool modern, bool real) {
   Schema s;
-  s.Add({"SpecialFolderNumber", kColumnLong, 0, Slot::kFixed});
-  s.Add({"FolderId", kColumnBinary, 0, Slot::kVariable});
-  s.Add({"ParentFolderId", kColumnBinary, 0, Slot::kVariable});
-  s.Add({"DisplayName", kColumnText, kCodePageUnicode, Slot::kVariable});
-  s.Add({"ContainerClass", kColumnText, kCodePageUnicode, Slot::kVariable});
-  s.Add({"PropertyBlob", kColumnLongBinary, 0, Slot::kTagged});
-  s.Add({"SeparatedProperty01", kColumnLongBinary, 0, Slot::kTagged});
-  s.Seal();
-  return s;
+  if (real) s.Add(Fixed("SpecialFolderNumber", kColumnLong));
+  s.Add({Variable(modern ? "FolderId" : "Q6748", kColumnBinary),
+         Variable(modern ? "ParentFolderId" : "Q6749", kColumnBinary),
+         Variable(modern ? "DisplayName" : "S3001", kColumnText, kCodePageUnicode),
+         Variable(modern ? "ContainerClass" : "S3613", kColumnText, kCodePageUnicode)});
+  if (real) {
+    s.Add({Tagged("PropertyBlob", kColumnLongBinary),
+           Tagged("SeparatedProperty01", kColumnLongBinary)});
+  }
+  return s.Columns();
 }
 
-Schema MessageRealSchema() {
+Columns MessageSchema(bool real) {
   Schema s;
-  s.Add({"MessageDocumentId", kColumnLong, 0, Slot::kFixed});
-  s.Add({"IsRead", kColumnBit, 0, Slot::kFixed});
-  s.Add({"Importance", kColumnLong, 0, Slot::kFixed});
-  s.Add({"HasAttachments", kColumnBit, 0, Slot::kFixed});
-  s.Add({"BodyType", kColumnShort, 0, Slot::kFixed});
-  s.Add({"DateCreated", kColumnDateTime, 0, Slot::kFixed});
-  s.Add({"DateReceived", kColumnDateTime, 0, Slot::kFixed});
-  s.Add({"DateSent", kColumnDateTime, 0, Slot::kFixed});
-  s.Add({"MessageId", kColumnBinary, 0, Slot::kVariable});
-  s.Add({"FolderId", kColumnBinary, 0, Slot::kVariable});
-  s.Add({"MessageClass", kColumnText, kCodePageWestern, Slot::kTagged});
-  s.Add({"DisplayTo", kColumnText, kCodePageUnicode, Slot::kTagged});
-  s.Add({"SubjectPrefix", kColumnText, kCodePageUnicode, Slot::kTagged});
-  s.Add({"PropertyBlob", kColumnLongBinary, 0, Slot::kTagged});
-  s.Add({"OffPagePropertyBlob", kColumnLongBinary, 0, Slot::kTagged});
-  s.Add({"RecipientList", kColumnLongBinary, 0, Slot::kTagged});
-  s.Add({"SubobjectsBlob", kColumnLongBinary, 0, Slot::kTagged});
-  s.Add({"NativeBody", kColumnLongBinary, 0, Slot::kTagged});
-  static const char* const kSeparated[kSeparatedColumns] = {
-      "SeparatedProperty01", "SeparatedProperty02", "SeparatedProperty03", "SeparatedProperty04"};
-  for (const char* name : kSeparated) s.Add({name, kColumnLongBinary, 0, Slot::kTagged});
-  s.Seal();
-  return s;
+  s.Add({Fixed("MessageDocumentId", kColumnLong), Fixed("IsRead", kColumnBit),
+         Fixed("Importance", kColumnLong), Fixed("HasAttachments", kColumnBit),
+         Fixed("BodyType", kColumnShort), Fixed("DateCreated", kColumnDateTime)});
+  if (real) {
+    s.Add({Fixed("DateReceived", kColumnDateTime), Fixed("DateSent", kColumnDateTime)});
+  } else {
+    s.Add({Fixed("LastModificationTime", kColumnDateTime), Fixed("DateReceived", kColumnDateTime)});
+  }
+  s.Add({Variable("MessageId", kColumnBinary), Variable("FolderId", kColumnBinary),
+         Tagged("MessageClass", kColumnText, kCodePageWestern),
+         Tagged("DisplayTo", kColumnText, kCodePageUnicode),
+         Tagged("SubjectPrefix", kColumnText, kCodePageUnicode),
+         Tagged("PropertyBlob", kColumnLongBinary)});
+  if (real) {
+    s.Add({Tagged("OffPagePropertyBlob", kColumnLongBinary),
+           Tagged("RecipientList", kColumnLongBinary),
+           Tagged("SubobjectsBlob", kColumnLongBinary)});
+  }
+  s.Add(Tagged("NativeBody", kColumnLongBinary));
+  if (real) {
+    for (const char* name : kSeparated) s.Add(Tagged(name, kColumnLongBinary));
+  }
+  return s.Columns();
 }
 
-Schema AttachmentRealSchema() {
+Columns AttachmentSchema(bool real) {
   Schema s;
-  s.Add({"Inid", kColumnLongLong, 0, Slot::kFixed});
-  s.Add({"Size", kColumnLong, 0, Slot::kFixed});
-  s.Add({"Name", kColumnText, kCodePageUnicode, Slot::kTagged});
-  s.Add({"ContentType", kColumnText, kCodePageUnicode, Slot::kTagged});
-  s.Add({"Content", kColumnLongBinary, 0, Slot::kTagged});
-  s.Add({"PropertyBlob", kColumnLongBinary, 0, Slot::kTagged});
-  s.Seal();
-  return s;
+  s.Add(Fixed("Inid", kColumnLongLong));
+  if (!real) s.Add(Fixed("MessageDocumentId", kColumnLong));
+  s.Add({Fixed("Size", kColumnLong), Tagged("Name", kColumnText, kCodePageUnicode)});
+  if (real) s.Add(Tagged("ContentType", kColumnText, kCodePageUnicode));
+  s.Add(Tagged("Content", kColumnLongBinary));
+  if (real) s.Add(Tagged("PropertyBlob", kColumnLongBinary));
+  return s.Columns();
 }
 
-Schema NameMappingSchema() {
-  Schema s;
-  s.Add({"PropNumber", kColumnLong, 0, Slot::kFixed});
-  s.Add({"PropDispId", kColumnLong, 0, Slot::kFixed});
-  s.Add({"PropGuid", kColumnBinary, 0, Slot::kVariable});
-  s.Add({"PropName", kColumnText, kCodePageUnicode, Slot::kVariable});
-  s.Seal();
-  return s;
+Columns NameMappingSchema() {
+  return Schema()
+      .Add({Fixed("PropNumber", kColumnLong), Fixed("PropDispId", kColumnLong),
+            Variable("PropGuid", kColumnBinary),
+            Variable("PropName", kColumnText, kCodePageUnicode)})
+      .Columns();
 }
 
 // The list columns of code 3, shared by "Body-x" and "MsgHeader-X". Times
 // are 64-bit little-endian integers of two types.
-void AddListColumns2010(Schema* s) {
-  s->Add({"Le07", kColumnLong, 0, Slot::kFixed});
-  s->Add({"L17", kColumnLong, 0, Slot::kFixed});
-  s->Add({"Be1b", kColumnBit, 0, Slot::kFixed});
-  s->Add({"T3007", kColumnCurrency, 0, Slot::kFixed});
-  s->Add({"T3008", kColumnLongLong, 0, Slot::kFixed});
-  s->Add({"Te06", kColumnCurrency, 0, Slot::kFixed});
-  s->Add({"Q6748", kColumnBinary, 0, Slot::kVariable});
-  s->Add({"N67b0", kColumnBinary, 0, Slot::kVariable});
-  s->Add({"S1a", kColumnText, kCodePageUnicode, Slot::kVariable});
-  s->Add({"S3d", kColumnText, kCodePageUnicode, Slot::kVariable});
-  s->Add({"Se1d", kColumnText, kCodePageUnicode, Slot::kVariable});
-  s->Add({"S42", kColumnText, kCodePageUnicode, Slot::kVariable});
-  s->Add({"S678e", kColumnText, kCodePageUnicode, Slot::kVariable});
-}
-
-Schema Header2010Schema() {
+Schema ListSchema2010() {
   Schema s;
-  AddListColumns2010(&s);
-  s.Seal();
+  s.Add({Fixed("Le07", kColumnLong), Fixed("L17", kColumnLong), Fixed("Be1b", kColumnBit),
+         Fixed("T3007", kColumnCurrency), Fixed("T3008", kColumnLongLong),
+         Fixed("Te06", kColumnCurrency), Variable("Q6748", kColumnBinary),
+         Variable("N67b0", kColumnBinary)});
+  for (const char* name : {"S1a", "S3d", "Se1d", "S42", "S678e"}) {
+    s.Add(Variable(name, kColumnText, kCodePageUnicode));
+  }
   return s;
 }
 
-Schema Body2010Schema() {
-  Schema s;
-  AddListColumns2010(&s);
-  s.Add({"Se04", kColumnText, kCodePageUnicode, Slot::kVariable});
-  s.Add({"L3fde", kColumnLong, 0, Slot::kFixed});
-  s.Add({"S1000", kColumnLongText, kCodePageUnicode, Slot::kTagged});
-  s.Add({"N1013", kColumnLongBinary, 0, Slot::kTagged});
-  s.Add({"N1009", kColumnLongBinary, 0, Slot::kTagged});
-  s.Add({"S7d", kColumnLongText, kCodePageUnicode, Slot::kTagged});
+Columns Body2010Schema() {
+  Schema s = ListSchema2010();
+  s.Add({Variable("Se04", kColumnText, kCodePageUnicode), Fixed("L3fde", kColumnLong),
+         Tagged("S1000", kColumnLongText, kCodePageUnicode), Tagged("N1013", kColumnLongBinary),
+         Tagged("N1009", kColumnLongBinary), Tagged("S7d", kColumnLongText, kCodePageUnicode)});
   for (const char* name :
        {"S3a06", "S3a08", "S3a11", "S3a16", "S3a17", "S3a1c", "S810c", "S814a"}) {
-    s.Add({name, kColumnText, kCodePageUnicode, Slot::kTagged});
+    s.Add(Tagged(name, kColumnText, kCodePageUnicode));
   }
   for (const char* name : {"T3a42", "T814e", "T8198", "T8078", "T8079"}) {
-    s.Add({name, kColumnLongLong, 0, Slot::kTagged});
+    s.Add(Tagged(name, kColumnLongLong));
   }
-  s.Add({"I3a4d", kColumnShort, 0, Slot::kTagged});
-  s.Add({"L805c", kColumnLong, 0, Slot::kTagged});
-  s.Add({"L26", kColumnLong, 0, Slot::kTagged});
-  s.Add({"L8138", kColumnLong, 0, Slot::kTagged});
-  s.Add({"D8121", kColumnDouble, 0, Slot::kTagged});
-  s.Add({"B8124", kColumnBit, 0, Slot::kTagged});
-  s.Add({"MN81a9", kColumnLongBinary, 0, Slot::kTagged});
-  s.Seal();
-  return s;
+  return s
+      .Add({Tagged("I3a4d", kColumnShort), Tagged("L805c", kColumnLong), Tagged("L26", kColumnLong),
+            Tagged("L8138", kColumnLong), Tagged("D8121", kColumnDouble),
+            Tagged("B8124", kColumnBit), Tagged("MN81a9", kColumnLongBinary)})
+      .Columns();
 }
 
-Schema Attachment2010Schema() {
-  Schema s;
-  s.Add({"Q674a", kColumnBinary, 0, Slot::kVariable});
-  s.Add({"N67b0", kColumnBinary, 0, Slot::kVariable});
-  s.Add({"S3001", kColumnText, kCodePageUnicode, Slot::kVariable});
-  s.Add({"S3704", kColumnText, kCodePageUnicode, Slot::kVariable});
-  s.Add({"N3701", kColumnLongBinary, 0, Slot::kTagged});
-  s.Seal();
-  return s;
+Columns Attachment2010Schema() {
+  return Schema()
+      .Add({Variable("Q674a", kColumnBinary), Variable("N67b0", kColumnBinary),
+            Variable("S3001", kColumnText, kCodePageUnicode),
+            Variable("S3704", kColumnText, kCodePageUnicode), Tagged("N3701", kColumnLongBinary)})
+      .Columns();
 }
 
 // ---- Values and keys
-
-Bytes Le64(uint64_t v) { return LittleEndian(v, kIdSize); }
-
-Bytes BinaryKey(const Bytes& bytes) {
-  Bytes key = {kKeyPrefix};
-  key.insert(key.end(), bytes.begin(), bytes.end());
-  key.push_back(kKeySuffix);
-  return key;
-}
 
 // The normalized key of a signed integer: sign bit flipped, big-endian.
 Bytes IntegerKey(uint64_t value, size_t width) {
@@ -331,37 +192,15 @@ Bytes IntegerKey(uint64_t value, size_t width) {
   return key;
 }
 
-bool IsAscii(const std::string& s) {
-  return std::all_of(s.begin(), s.end(),
-                     [](char c) { return static_cast<unsigned char>(c) < 0x80; });
-}
-
-void AppendUtf16z(Bytes* out, const std::string& utf8) {
-  const Bytes b = Utf8ToUtf16LE(utf8);
-  out->insert(out->end(), b.begin(), b.end());
-  out->push_back(0);
-  out->push_back(0);
-}
-
-// Distribution-list members as the legacy builder writes them.
-Bytes EncodeMembers(const std::vector<ListMember>& members) {
-  constexpr uint32_t kHeader = 8;
-  constexpr uint8_t kOneOffUid[16] = {0x81, 0x2B, 0x1F, 0xA4, 0xBE, 0xA3, 0x10, 0x19,
-                                      0x9D, 0x6E, 0x00, 0xDD, 0x01, 0x0F, 0x54, 0x02};
-  constexpr uint16_t kUnicode = 0x8000;
-  Bytes out(kHeader);
-  StoreU32LE(out.data(), kHeader);
-  StoreU32LE(out.data() + 4, uint32_t(members.size()));
-  for (const ListMember& m : members) {
-    const size_t at = out.size();
-    out.resize(at + 4 + sizeof kOneOffUid + 4, 0);
-    std::memcpy(out.data() + at + 4, kOneOffUid, sizeof kOneOffUid);
-    StoreU16LE(out.data() + at + 4 + sizeof kOneOffUid + 2, kUnicode);
-    AppendUtf16z(&out, m.name);
-    AppendUtf16z(&out, m.address_type);
-    AppendUtf16z(&out, m.address);
+// "a;b;c" as its parts, empty ones included.
+std::vector<std::string> SplitValues(const std::string& value) {
+  std::vector<std::string> parts;
+  size_t start = 0;
+  for (size_t at; (at = value.find(';', start)) != std::string::npos; start = at + 1) {
+    parts.push_back(value.substr(start, at - start));
   }
-  return out;
+  parts.push_back(value.substr(start));
+  return parts;
 }
 
 // ---- Real layout: ids, named properties, recipients
@@ -481,21 +320,6 @@ class NamedNumbers {
   std::map<NamedProperty, uint16_t> numbers_;
 };
 
-// A one-off entry id: flags, provider, version, flags (Unicode), then the
-// name, address type and address as UTF-16LE strings with terminators.
-Bytes OneOffEntryId(const ListMember& m) {
-  constexpr uint8_t kOneOffUid[16] = {0x81, 0x2B, 0x1F, 0xA4, 0xBE, 0xA3, 0x10, 0x19,
-                                      0x9D, 0x6E, 0x00, 0xDD, 0x01, 0x0F, 0x54, 0x02};
-  constexpr uint16_t kUnicode = 0x8000;
-  Bytes out(4 + sizeof kOneOffUid + 4, 0);
-  std::memcpy(out.data() + 4, kOneOffUid, sizeof kOneOffUid);
-  StoreU16LE(out.data() + 4 + sizeof kOneOffUid + 2, kUnicode);
-  AppendUtf16z(&out, m.name);
-  AppendUtf16z(&out, m.address_type);
-  AppendUtf16z(&out, m.address);
-  return out;
-}
-
 // Recipient blobs framed as this builder frames them: u32 count, then per
 // recipient u32 length and the blob.
 constexpr uint16_t kPropRecipientType = 0x0C15;
@@ -547,201 +371,6 @@ Bytes RecipientList(const std::string& to, const std::string& cc) {
   return out;
 }
 
-// ---- Output
-
-class FilePageSink : public PageSink {
- public:
-  FilePageSink(int fd, uint32_t page_size) : fd_(fd), page_size_(page_size) {}
-  Status Put(uint32_t page_number, Bytes image) override {
-    if (!buffer_.empty() && page_number != first_ + buffer_.size() / page_size_) {
-      Status s = Flush();
-      if (!s.ok()) return s;
-    }
-    if (buffer_.empty()) first_ = page_number;
-    buffer_.insert(buffer_.end(), image.begin(), image.end());
-    return buffer_.size() >= kWriteBuffer ? Flush() : Status::Ok();
-  }
-  Status Flush() {
-    if (buffer_.empty()) return Status::Ok();
-    // Page n sits after the two header pages.
-    Status s = WriteAt(off_t(first_ + 1) * page_size_, buffer_.data(), buffer_.size());
-    buffer_.clear();
-    return s;
-  }
-  Status WriteAt(off_t offset, const uint8_t* data, size_t size) {
-    while (size > 0) {
-      const ssize_t n = pwrite(fd_, data, size, offset);
-      if (n <= 0) return Status::IoError(std::string("write failed: ") + std::strerror(errno));
-      data += n;
-      size -= size_t(n);
-      offset += n;
-    }
-    return Status::Ok();
-  }
-
- private:
-  int fd_;
-  uint32_t page_size_;
-  uint32_t first_ = 0;
-  Bytes buffer_;
-};
-
-// One table being streamed: its record tree and its long-value tree.
-class StreamTable {
- public:
-  StreamTable(DatabaseWriter* db, std::string name, Schema schema, uint32_t max_rows_per_leaf,
-              uint32_t long_value_id_size = kLongValueIdSize)
-      : db_(db), name_(std::move(name)), schema_(std::move(schema)), id_size_(long_value_id_size) {
-    options_ = db->NewTree(0);
-    options_.max_entries_per_leaf = max_rows_per_leaf;
-    writer_ = std::make_unique<TreeWriter>(db->format(), options_, db->allocator(), db->sink());
-    lv_options_ = db->NewTree(kPageFlagLongValue);
-    lv_writer_ =
-        std::make_unique<TreeWriter>(db->format(), lv_options_, db->allocator(), db->sink());
-    // Ids past 32 bits, so that only a reader of 8-byte ids finds the values.
-    if (id_size_ == kLongValueId64Size) next_lv_ = kFirstWideLongValueId;
-    chunk_size_ = DefaultLongValueChunkSize(db->format(), id_size_);
-  }
-
-  const Schema& schema() const { return schema_; }
-  const std::string& name() const { return name_; }
-  uint64_t rows() const { return rows_; }
-  uint32_t long_value_id_size() const { return id_size_; }
-
-  Status AddRow(Bytes key, const std::vector<Cell>& cells) {
-    TreeEntry e;
-    e.key = std::move(key);
-    Status s = EncodeRecord(schema_.columns(), cells, db_->layout(), &e.data);
-    if (s.ok()) s = writer_->Add(std::move(e));
-    if (!s.ok()) return Status::InvalidArgument(name_ + ": " + s.message());
-    ++rows_;
-    return s;
-  }
-
-  Status AddLongValue(Bytes data, Compression compression, uint64_t* id) {
-    LongValueLayout v;
-    v.id = next_lv_++;
-    v.data = std::move(data);
-    v.compression = compression;
-    std::vector<TreeEntry> entries;
-    Status s = AppendLongValueEntries(v, id_size_, chunk_size_, std::nullopt, &entries, nullptr);
-    for (TreeEntry& e : entries) {
-      if (!s.ok()) break;
-      s = lv_writer_->Add(std::move(e));
-    }
-    *id = v.id;
-    return s;
-  }
-
-  Status Finish() {
-    TreeLayout layout, lv_layout;
-    Status s = writer_->Finish(&layout);
-    if (s.ok()) s = lv_writer_->Finish(&lv_layout);
-    if (!s.ok()) return Status::InvalidArgument(name_ + ": " + s.message());
-    db_->AddTable(name_, schema_.columns(), options_, layout, &lv_options_, &lv_layout);
-    return s;
-  }
-
- private:
-  DatabaseWriter* db_;
-  std::string name_;
-  Schema schema_;
-  uint32_t id_size_;
-  TreeOptions options_, lv_options_;
-  std::unique_ptr<TreeWriter> writer_, lv_writer_;
-  uint32_t chunk_size_ = 0;
-  uint64_t next_lv_ = 1;
-  uint64_t rows_ = 0;
-};
-
-// Cells of one row, by column name.
-class Row {
- public:
-  Row(StreamTable* table, uint32_t long_value_limit, uint32_t record_budget)
-      : table_(table), limit_(long_value_limit), budget_(record_budget) {}
-
-  const ColumnLayout* Column(const std::string& name) const { return table_->schema().Find(name); }
-
-  Status Put(const std::string& name, Bytes value) {
-    const ColumnLayout* c = Column(name);
-    if (!c) return Missing(name);
-    used_ += value.size();
-    cells_.push_back({c->id, std::move(value), 0});
-    return Status::Ok();
-  }
-  Status Number(const std::string& name, uint64_t value) {
-    const ColumnLayout* c = Column(name);
-    if (!c) return Missing(name);
-    size_t width = 4;
-    if (c->type == kColumnBit) width = 1;
-    if (c->type == kColumnShort) width = 2;
-    if (c->type == kColumnCurrency || c->type == kColumnLongLong || c->type == kColumnDateTime ||
-        c->type == kColumnDouble) {
-      width = 8;
-    }
-    return Put(name, LittleEndian(value, width));
-  }
-  // Text in the column's code page; with `seven_bit`, stored 7-bit
-  // compressed when every character allows it.
-  Status Text(const std::string& name, const std::string& utf8, bool seven_bit = false) {
-    const ColumnLayout* c = Column(name);
-    if (!c) return Missing(name);
-    const bool unicode = c->codepage == kCodePageUnicode;
-    Bytes plain;
-    if (unicode) {
-      plain = Utf8ToUtf16LE(utf8);
-    } else {
-      const std::string bytes = Utf8ToCodePage(utf8, c->codepage);
-      plain.assign(bytes.begin(), bytes.end());
-    }
-    Cell cell;
-    if (seven_bit && IsAscii(utf8) &&
-        CompressedCell(c->id, ByteView(plain),
-                       unicode ? Compression::kSevenBitUnicode : Compression::kSevenBitAscii,
-                       &cell)) {
-      used_ += cell.value->size();
-      cells_.push_back(std::move(cell));
-      return Status::Ok();
-    }
-    return Put(name, std::move(plain));
-  }
-  // A tagged value that goes to the long-value tree when it is large or
-  // the record is filling up; Xpress compressed when `compression` says so.
-  Status Large(const std::string& name, Bytes value, Compression compression,
-               bool* separated = nullptr) {
-    const ColumnLayout* c = Column(name);
-    if (!c) return Missing(name);
-    Cell cell;
-    const bool compressed = compression != Compression::kNone && value.size() <= limit_ &&
-                            CompressedCell(c->id, ByteView(value), compression, &cell);
-    const size_t stored = compressed ? cell.value->size() : value.size();
-    const bool to_tree = stored > limit_ || used_ + stored > budget_;
-    if (separated) *separated = to_tree;
-    if (!to_tree) {
-      if (!compressed) return Put(name, std::move(value));
-      used_ += stored;
-      cells_.push_back(std::move(cell));
-      return Status::Ok();
-    }
-    uint64_t id = 0;
-    Status s = table_->AddLongValue(std::move(value), compression, &id);
-    if (s.ok()) cells_.push_back(SeparatedCell(c->id, id, table_->long_value_id_size()));
-    return s;
-  }
-  std::vector<Cell>& cells() { return cells_; }
-
- private:
-  Status Missing(const std::string& name) const {
-    return Status::InvalidArgument(table_->name() + " has no column " + name);
-  }
-
-  StreamTable* table_;
-  uint32_t limit_;
-  uint32_t budget_;
-  size_t used_ = 0;
-  std::vector<Cell> cells_;
-};
-
 // ---- Content
 
 std::string Lower(std::string s) {
@@ -783,6 +412,41 @@ std::string LargeHtml() {
     html += "<p>Zeile " + std::to_string(i) + ": Größenprüfung — длинное письмо, 長い本文.</p>\n";
   }
   return html + "</body></html>\n";
+}
+
+// The columns of a code-5 message row that both layouts write alike.
+Status PutMessageColumns(Row* row, const ManifestItem& item, Bytes message_id, Bytes folder_id) {
+  Status s = row->Number("MessageDocumentId", uint32_t(item.document_id));
+  auto next = [&](Status st) {
+    if (s.ok()) s = st;
+  };
+  next(row->Put("MessageId", std::move(message_id)));
+  next(row->Put("FolderId", std::move(folder_id)));
+  next(row->Text("MessageClass", item.message_class, true));
+  if (!item.to.empty()) next(row->Text("DisplayTo", item.to, true));
+  if (!item.subject_prefix.empty()) next(row->Text("SubjectPrefix", item.subject_prefix, true));
+  next(row->Number("DateCreated", item.created));
+  next(row->Number("DateReceived", item.received));
+  next(row->Number("IsRead", (item.flags & kFlagRead) ? kBitTrue : 0));
+  next(row->Number("Importance", item.importance));
+  next(row->Number("HasAttachments", item.has_attachments ? kBitTrue : 0));
+  if (item.body_type) next(row->Number("BodyType", item.body_type));
+  return s;
+}
+
+// "NativeBody": the body in its own format, Xpress compressed.
+Status PutNativeBody(Row* row, ManifestItem* item) {
+  if (!item->body_type) return Status::Ok();
+  const std::string& body = item->body_type == kBodyTypeHtml ? item->body_html : item->body_text;
+  return row->Large("NativeBody", Bytes(body.begin(), body.end()), Compression::kXpress,
+                    &item->body_long_value);
+}
+
+// The attachment name readers pick, its size and digest.
+void DescribeAttachment(ManifestAttachment* a, bool record_digest) {
+  a->name = !a->display_name.empty() ? a->display_name : a->file_name;
+  a->size = a->data.size();
+  if (record_digest) a->sha256 = Sha256Hex(ByteView(a->data));
 }
 
 // ---- The store
@@ -970,7 +634,7 @@ Status ModernWriter::WriteMailboxes(StreamTable* table) {
       if (s.ok() && real_) {
         RealBlobEncoder blob;
         blob.AddString(kPropDisplayName, mb.name);
-        s = row.Large("PropertyBlob", blob.Finish(nullptr), Compression::kNone);
+        s = row.Large("PropertyBlob", blob.Finish(nullptr));
       }
     } else {
       s = row.Put("Q6764", Le64(mb.number));
@@ -1005,7 +669,7 @@ Status ModernWriter::WriteFolders(size_t mailbox) {
       RealBlobEncoder blob;
       blob.AddString(kPropDisplayName, f.name);
       blob.AddString(kPropContainerClass, f.container_class);
-      if (s.ok()) s = row.Large("PropertyBlob", blob.Finish(nullptr), Compression::kNone);
+      if (s.ok()) s = row.Large("PropertyBlob", blob.Finish(nullptr));
     } else {
       s = row.Put(modern_ ? "FolderId" : "Q6748", Le64(f.id));
       if (s.ok()) s = row.Put(modern_ ? "ParentFolderId" : "Q6749", Le64(f.parent));
@@ -1056,15 +720,9 @@ Status ModernWriter::WriteItem2013(size_t folder, ManifestItem* item, bool short
   }
   for (const auto& [name, value] : item->strings) {
     if (name.rfind("MS", 0) == 0) {
-      std::vector<std::string> parts;
-      size_t start = 0;
-      for (size_t at; (at = value.find(';', start)) != std::string::npos; start = at + 1) {
-        parts.push_back(value.substr(start, at - start));
-      }
-      parts.push_back(value.substr(start));
       std::string letters;
       uint16_t id = 0;
-      if (!SplitPropertyName(name, &letters, &id) || !blob.AddMultiString(id, parts)) {
+      if (!SplitPropertyName(name, &letters, &id) || !blob.AddMultiString(id, SplitValues(value))) {
         return Status::InvalidArgument("cannot put " + name + " in a property blob");
       }
     } else if (!blob.AddNamedString(name, value)) {
@@ -1080,37 +738,21 @@ Status ModernWriter::WriteItem2013(size_t folder, ManifestItem* item, bool short
   if (!item->headers.empty()) blob.AddString(0x007D, item->headers);
 
   Row row(t.messages.get(), limit_, budget_);
-  Status s = row.Number("MessageDocumentId", uint32_t(item->document_id));
+  Status s = PutMessageColumns(&row, *item, short_id ? item->key : MessageId(mailbox, item->key),
+                               Le64(content_.folders[folder].id));
   auto next = [&](Status st) {
     if (s.ok()) s = st;
   };
-  next(row.Put("MessageId", short_id ? item->key : MessageId(mailbox, item->key)));
-  next(row.Put("FolderId", Le64(content_.folders[folder].id)));
-  next(row.Text("MessageClass", item->message_class, true));
-  if (!item->to.empty()) next(row.Text("DisplayTo", item->to, true));
-  if (!item->subject_prefix.empty()) next(row.Text("SubjectPrefix", item->subject_prefix, true));
-  next(row.Number("DateCreated", item->created));
   next(row.Number("LastModificationTime", item->modified));
-  next(row.Number("DateReceived", item->received));
-  next(row.Number("IsRead", (item->flags & kFlagRead) ? kBitTrue : 0));
-  next(row.Number("Importance", item->importance));
-  next(row.Number("HasAttachments", item->has_attachments ? kBitTrue : 0));
-  if (item->body_type) next(row.Number("BodyType", item->body_type));
-  next(row.Large("PropertyBlob", blob.Finish(), Compression::kNone));
-  if (item->body_type) {
-    const std::string& body = item->body_type == kBodyTypeHtml ? item->body_html : item->body_text;
-    next(row.Large("NativeBody", Bytes(body.begin(), body.end()), Compression::kXpress,
-                   &item->body_long_value));
-  }
+  next(row.Large("PropertyBlob", blob.Finish()));
+  next(PutNativeBody(&row, item));
   if (s.ok()) s = t.messages->AddRow(IntegerKey(uint32_t(item->document_id), 4), row.cells());
   if (!s.ok()) return s;
 
   for (ManifestAttachment& a : item->attachments) {
     const uint64_t inid = ++attachment_counter_;
     a.key = Le64(inid);
-    a.name = !a.display_name.empty() ? a.display_name : a.file_name;
-    a.size = a.data.size();
-    if (manifest_->items_recorded) a.sha256 = Sha256Hex(ByteView(a.data));
+    DescribeAttachment(&a, manifest_->items_recorded);
     Row arow(t.attachments.get(), limit_, budget_);
     s = arow.Number("Inid", inid);
     next(arow.Number("MessageDocumentId", uint32_t(item->document_id)));
@@ -1169,13 +811,8 @@ Status ModernWriter::WriteItemReal(size_t folder, ManifestItem* item, bool short
   for (const auto& [name, value] : item->strings) {
     if (!(s = id_of(name, &id)).ok()) return s;
     if (name.rfind("MS", 0) == 0) {
-      std::vector<std::string> parts;
-      size_t start = 0;
-      for (size_t at; (at = value.find(';', start)) != std::string::npos; start = at + 1) {
-        parts.push_back(value.substr(start, at - start));
-      }
-      parts.push_back(value.substr(start));
-      if (!own.AddMultiString(id, parts)) return Status::InvalidArgument("blob " + name);
+      if (!own.AddMultiString(id, SplitValues(value)))
+        return Status::InvalidArgument("blob " + name);
     } else if (!own.AddString(id, value)) {
       return Status::InvalidArgument("blob " + name);
     }
@@ -1220,34 +857,19 @@ Status ModernWriter::WriteItemReal(size_t folder, ManifestItem* item, bool short
   if (!short_id) item->key.assign(message_id.end() - kIdSize, message_id.end());
 
   Row row(t.messages.get(), limit_, budget_);
-  s = row.Number("MessageDocumentId", uint32_t(item->document_id));
+  s = PutMessageColumns(&row, *item, short_id ? item->key : message_id,
+                        RealFolderId(content_.folders[folder].id));
   auto next = [&](Status st) {
     if (s.ok()) s = st;
   };
-  next(row.Put("MessageId", short_id ? item->key : message_id));
-  next(row.Put("FolderId", RealFolderId(content_.folders[folder].id)));
-  next(row.Text("MessageClass", item->message_class, true));
-  if (!item->to.empty()) next(row.Text("DisplayTo", item->to, true));
-  if (!item->subject_prefix.empty()) next(row.Text("SubjectPrefix", item->subject_prefix, true));
-  next(row.Number("DateCreated", item->created));
-  next(row.Number("DateReceived", item->received));
   next(row.Number("DateSent", item->received));
-  next(row.Number("IsRead", (item->flags & kFlagRead) ? kBitTrue : 0));
-  next(row.Number("Importance", item->importance));
-  next(row.Number("HasAttachments", item->has_attachments ? kBitTrue : 0));
-  if (item->body_type) next(row.Number("BodyType", item->body_type));
-  next(row.Large("PropertyBlob", main_blob, Compression::kNone));
-  if (!own_blob.empty()) next(row.Large("OffPagePropertyBlob", own_blob, Compression::kNone));
+  next(row.Large("PropertyBlob", main_blob));
+  if (!own_blob.empty()) next(row.Large("OffPagePropertyBlob", own_blob));
   if (!item->to.empty() || !item->cc.empty()) {
-    next(row.Large("RecipientList", RecipientList(item->to, item->cc), Compression::kNone));
+    next(row.Large("RecipientList", RecipientList(item->to, item->cc)));
   }
-  if (!inids.empty())
-    next(row.Large("SubobjectsBlob", EncodeCompactIntegers(inids), Compression::kNone));
-  if (item->body_type) {
-    const std::string& body = item->body_type == kBodyTypeHtml ? item->body_html : item->body_text;
-    next(row.Large("NativeBody", Bytes(body.begin(), body.end()), Compression::kXpress,
-                   &item->body_long_value));
-  }
+  if (!inids.empty()) next(row.Large("SubobjectsBlob", EncodeCompactIntegers(inids)));
+  next(PutNativeBody(&row, item));
   for (const SeparatedValue& v : separated) {
     if (v.slot > kSeparatedColumns) return Status::InvalidArgument("too many far values");
     char column[32];
@@ -1260,9 +882,7 @@ Status ModernWriter::WriteItemReal(size_t folder, ManifestItem* item, bool short
   for (size_t k = 0; k < item->attachments.size(); ++k) {
     ManifestAttachment& a = item->attachments[k];
     const uint64_t inid = uint64_t(inids[k]);
-    a.name = !a.display_name.empty() ? a.display_name : a.file_name;
-    a.size = a.data.size();
-    if (manifest_->items_recorded) a.sha256 = Sha256Hex(ByteView(a.data));
+    DescribeAttachment(&a, manifest_->items_recorded);
     RealBlobEncoder ablob;
     if (!a.file_name.empty()) ablob.AddString(kPropAttachFileName, a.file_name);
     if (!a.long_file_name.empty()) ablob.AddString(kPropAttachLongFileName, a.long_file_name);
@@ -1274,7 +894,7 @@ Status ModernWriter::WriteItemReal(size_t folder, ManifestItem* item, bool short
     next(arow.Text("Name", a.name));
     next(arow.Text("ContentType", "application/octet-stream"));
     next(arow.Large("Content", a.data, Compression::kNone, &a.long_value));
-    next(arow.Large("PropertyBlob", ablob.Finish(nullptr), Compression::kNone));
+    next(arow.Large("PropertyBlob", ablob.Finish(nullptr)));
     if (s.ok()) s = t.attachments->AddRow(IntegerKey(inid, 8), arow.cells());
     if (!s.ok()) return s;
     ++manifest_->attachment_rows;
@@ -1288,7 +908,8 @@ Status ModernWriter::WriteNameMappings(DatabaseWriter* db) {
     if (!tables_[i].named) continue;
     const std::string name =
         "ExtendedPropertyNameMapping_" + std::to_string(manifest_->mailboxes[i].number);
-    StreamTable table(db, name, NameMappingSchema(), 0, kLongValueId64Size);
+    StreamTable table(db, name, NameMappingSchema(),
+                      {.long_values = true, .long_value_id_size = kLongValueId64Size});
     std::vector<std::pair<uint16_t, NamedProperty>> rows;
     for (const auto& [p, number] : tables_[i].named->numbers()) rows.push_back({number, p});
     std::sort(rows.begin(), rows.end(),
@@ -1315,23 +936,8 @@ Status ModernWriter::WriteItem2010(size_t folder, ManifestItem* item) {
   const Bytes folder_id = Le64(content_.folders[folder].id);
 
   auto list_cells = [&](Row* row) {
-    Status s = row->Put("N67b0", item->key);
-    auto next = [&](Status st) {
-      if (s.ok()) s = st;
-    };
-    next(row->Put("Q6748", folder_id));
-    next(row->Text("S1a", item->message_class));
-    if (!item->subject_prefix.empty()) next(row->Text("S3d", item->subject_prefix));
-    next(row->Text("Se1d", item->normalized_subject));
-    if (!item->sender.empty()) next(row->Text("S42", item->sender));
-    if (!item->to.empty()) next(row->Text("S678e", item->to));
-    next(row->Number("T3007", item->created));
-    next(row->Number("T3008", item->modified));
-    next(row->Number("Te06", item->received));
-    next(row->Number("Le07", item->flags));
-    next(row->Number("L17", item->importance));
-    next(row->Number("Be1b", item->has_attachments ? kBitTrue : 0));
-    return s;
+    Status s = PutListColumns(row, *item);
+    return s.ok() ? row->Put("Q6748", folder_id) : s;
   };
 
   Row header(t.headers.get(), limit_, budget_);
@@ -1345,45 +951,13 @@ Status ModernWriter::WriteItem2010(size_t folder, ManifestItem* item) {
     if (s.ok()) s = st;
   };
   if (!item->to.empty()) next(row.Text("Se04", item->to));
-  next(row.Number("L3fde", kInternetCodePageUtf8));
-  bool separated = false;
-  if (!item->body_text.empty()) {
-    next(row.Large("S1000", Utf8ToUtf16LE(item->body_text), Compression::kNone, &separated));
-    item->body_long_value |= separated;
-  }
-  if (!item->body_html.empty()) {
-    next(row.Large("N1013", Bytes(item->body_html.begin(), item->body_html.end()),
-                   Compression::kNone, &separated));
-    item->body_long_value |= separated;
-  }
-  if (!item->rtf_text.empty()) {
-    Bytes rtf = item->rtf_uses_references ? EncodeRtfCompressed(item->rtf_text)
-                                          : EncodeRtfLiteral(item->rtf_text);
-    next(row.Large("N1009", std::move(rtf), Compression::kNone, &separated));
-    item->body_long_value |= separated;
-  }
-  if (!item->headers.empty()) {
-    next(row.Large("S7d", Utf8ToUtf16LE(item->headers), Compression::kNone));
-  }
-  for (const auto& [name, value] : item->strings) next(row.Text(name, value));
-  for (const auto& [name, value] : item->times) next(row.Number(name, value));
-  for (const auto& [name, value] : item->numbers) next(row.Number(name, uint64_t(value)));
-  for (const auto& [name, value] : item->doubles) {
-    uint64_t bits;
-    std::memcpy(&bits, &value, sizeof bits);
-    next(row.Number(name, bits));
-  }
-  if (!item->members.empty()) {
-    next(row.Large("MN81a9", EncodeMembers(item->members), Compression::kNone));
-  }
+  next(PutPropertyColumns(&row, item));
   if (s.ok()) s = t.messages->AddRow(BinaryKey(item->key), row.cells());
   if (!s.ok()) return s;
 
   for (ManifestAttachment& a : item->attachments) {
     a.key = ItemKey(++attachment_counter_);
-    a.name = !a.display_name.empty() ? a.display_name : a.file_name;
-    a.size = a.data.size();
-    if (manifest_->items_recorded) a.sha256 = Sha256Hex(ByteView(a.data));
+    DescribeAttachment(&a, manifest_->items_recorded);
     Row arow(t.attachments.get(), limit_, budget_);
     s = arow.Put("Q674a", a.key);
     next(arow.Put("N67b0", item->key));
@@ -1468,36 +1042,33 @@ Status ModernWriter::Write(const std::string& path) {
     m.folders[i].content_table = modern_ ? mb.message_table : mb.header_table;
   }
 
-  const int fd = open(path.c_str(), O_CREAT | O_TRUNC | O_WRONLY, 0644);
-  if (fd < 0) return Status::IoError("cannot create " + path);
-  FilePageSink sink(fd, layout.page_size);
-  Status s = [&]() -> Status {
-    DatabaseWriter db(layout, &sink);
+  DatabaseFile file(layout.page_size);
+  Status s = file.Create(path);
+  if (!s.ok()) return s;
+  s = [&]() -> Status {
+    DatabaseWriter db(layout, &file);
     if (!db.status().ok()) return db.status();
-    const uint32_t ids = real_ ? kLongValueId64Size : kLongValueIdSize;
-    StreamTable mailbox(&db, "Mailbox",
-                        real_ ? MailboxRealSchema() : MailboxSchema(options_.version), 0, ids);
-    const uint32_t leaf = options_.max_rows_per_leaf;
+    // Every table has a long-value tree, as the servers' tables do.
+    const StreamTableOptions small = {
+        .long_values = true, .long_value_id_size = real_ ? kLongValueId64Size : kLongValueIdSize};
+    StreamTableOptions large = small;
+    large.max_rows_per_leaf = options_.max_rows_per_leaf;
+    StreamTable mailbox(&db, "Mailbox", MailboxSchema(modern_, real_), small);
     for (size_t i = 0; i < m.mailboxes.size(); ++i) {
       const ManifestMailbox& mb = m.mailboxes[i];
       MailboxTables& t = tables_.emplace_back();
       if (!mb.damage.empty()) continue;
-      t.folders = std::make_unique<StreamTable>(
-          &db, mb.folder_table, real_ ? FolderRealSchema() : FolderSchema(options_.version), 0,
-          ids);
-      t.messages = std::make_unique<StreamTable>(&db, mb.message_table,
-                                                 real_     ? MessageRealSchema()
-                                                 : modern_ ? Message2013Schema()
-                                                           : Body2010Schema(),
-                                                 leaf, ids);
-      t.attachments = std::make_unique<StreamTable>(&db, mb.attachment_table,
-                                                    real_     ? AttachmentRealSchema()
-                                                    : modern_ ? Attachment2013Schema()
-                                                              : Attachment2010Schema(),
-                                                    leaf, ids);
+      t.folders =
+          std::make_unique<StreamTable>(&db, mb.folder_table, FolderSchema(modern_, real_), small);
+      t.messages = std::make_unique<StreamTable>(
+          &db, mb.message_table, modern_ ? MessageSchema(real_) : Body2010Schema(), large);
+      t.attachments = std::make_unique<StreamTable>(
+          &db, mb.attachment_table, modern_ ? AttachmentSchema(real_) : Attachment2010Schema(),
+          large);
       if (real_) t.named = std::make_unique<NamedNumbers>(i);
       if (!modern_) {
-        t.headers = std::make_unique<StreamTable>(&db, mb.header_table, Header2010Schema(), leaf);
+        t.headers =
+            std::make_unique<StreamTable>(&db, mb.header_table, ListSchema2010().Columns(), large);
       }
     }
     Status st = WriteMailboxes(&mailbox);
@@ -1542,19 +1113,11 @@ Status ModernWriter::Write(const std::string& path) {
     }
     if (st.ok() && real_) st = WriteNameMappings(&db);
     if (!st.ok()) return st;
-    Bytes header;
     Manifest pages;
-    st = db.Finish(&header, &pages);
-    if (st.ok()) st = sink.Flush();
-    if (st.ok()) st = sink.WriteAt(0, header.data(), header.size());
-    if (st.ok()) st = sink.WriteAt(layout.page_size, header.data(), header.size());
-    const off_t size = off_t(db.total_pages() + 2) * layout.page_size;
-    if (st.ok() && ftruncate(fd, size) != 0) st = Status::IoError("cannot size " + path);
-    return st;
+    return file.Finish(&db, &pages);
   }();
   tables_.clear();
-  if (close(fd) != 0 && s.ok()) s = Status::IoError("cannot write " + path);
-  return s;
+  return file.Close(s);
 }
 
 }  // namespace

@@ -1,26 +1,18 @@
 #include "testing/exchange/store_builder.h"
 
-#include <fcntl.h>
-#include <unistd.h>
-
 #include <algorithm>
-#include <cctype>
-#include <cerrno>
 #include <cstdio>
 #include <cstring>
 #include <map>
 #include <memory>
-#include <optional>
 #include <set>
 #include <vector>
 
 #include "base/text.h"
-#include "testing/exchange/rtf_literal_encoder.h"
+#include "testing/exchange/store_tables.h"
 #include "testing/forge_database.h"
-#include "testing/forge_long_value.h"
 #include "testing/forge_record.h"
-#include "testing/forge_tree.h"
-#include "testing/forge_value.h"
+#include "testing/forge_stream.h"
 
 namespace tarnwell::forge::exchange {
 namespace {
@@ -31,75 +23,15 @@ constexpr uint32_t kPage8K = 8192;
 constexpr uint32_t kRevision55 = 2;
 constexpr uint32_t kRevision2000 = 9;
 constexpr uint32_t kRevision2007 = 12;
-
-constexpr uint32_t kCodePageUnicode = 1200;
-constexpr uint32_t kCodePageWestern = 1252;
-constexpr uint32_t kInternetCodePageUtf8 = 65001;
-
-constexpr uint8_t kKeyPrefix = 0x7F;
-constexpr uint8_t kKeySuffix = 0x08;
+// A second row under a key: the first row's key plus this byte.
 constexpr uint8_t kDuplicateKeyTail = 0x01;
-constexpr size_t kIdSize = 8;
-constexpr uint8_t kBitTrue = 1;
 
 // A record must fit its page with room for the node header and the tag; keep
 // well below that so several big values in one row still fit.
 constexpr uint32_t kRecordBudgetDivisor = 2;
 constexpr uint32_t kDefaultLimitDivisor = 4;
 
-// One-off entry id of a distribution-list member.
-constexpr uint8_t kOneOffProviderUid[16] = {0x81, 0x2B, 0x1F, 0xA4, 0xBE, 0xA3, 0x10, 0x19,
-                                            0x9D, 0x6E, 0x00, 0xDD, 0x01, 0x0F, 0x54, 0x02};
-constexpr uint16_t kOneOffUnicode = 0x8000;
-constexpr uint32_t kMemberListHeader = 8;  // u32 offset, u32 count
-
-constexpr size_t kWriteBuffer = 4 << 20;
-
 // ---- Table schemas
-
-enum class Slot { kFixed, kVariable, kTagged };
-
-struct Column {
-  const char* name;
-  uint32_t type;
-  uint32_t codepage;
-  Slot slot;
-};
-
-class Schema {
- public:
-  void Add(const Column& c) {
-    uint32_t& next = c.slot == Slot::kFixed      ? next_fixed_
-                     : c.slot == Slot::kVariable ? next_variable_
-                                                 : next_tagged_;
-    ColumnLayout layout;
-    layout.id = next++;
-    layout.name = c.name;
-    layout.type = c.type;
-    layout.codepage = c.codepage;
-    // Fixed binary columns need their width; 8 is all any of ours hold.
-    if (c.slot == Slot::kFixed && c.type == kColumnBinary) layout.size = kIdSize;
-    columns_.push_back(layout);
-  }
-  // Ids ascending, as the catalog and the record encoder want them.
-  void Seal() {
-    std::sort(columns_.begin(), columns_.end(),
-              [](const ColumnLayout& a, const ColumnLayout& b) { return a.id < b.id; });
-    for (size_t i = 0; i < columns_.size(); ++i) index_[columns_[i].name] = i;
-  }
-  const ColumnLayout* Find(const std::string& name) const {
-    auto it = index_.find(name);
-    return it == index_.end() ? nullptr : &columns_[it->second];
-  }
-  const std::vector<ColumnLayout>& columns() const { return columns_; }
-
- private:
-  std::vector<ColumnLayout> columns_;
-  std::map<std::string, size_t> index_;
-  uint32_t next_fixed_ = 1;
-  uint32_t next_variable_ = kFirstVariableColumnId;
-  uint32_t next_tagged_ = kFirstTaggedColumnId;
-};
 
 enum class TimeForm { kCurrency, kLongLong, kBinaryBigEndian };
 
@@ -143,335 +75,95 @@ ListTimeForms ListTimes(int version) {
   }
 }
 
-Schema MailboxSchema() {
-  Schema s;
-  s.Add({"Q6764", kColumnBinary, 0, Slot::kVariable});
-  s.Add({"S3001", kColumnText, kCodePageUnicode, Slot::kVariable});
-  s.Add({"N66a0", kColumnBinary, 0, Slot::kVariable});
-  s.Seal();
-  return s;
+using Columns = std::vector<ColumnLayout>;
+
+Columns MailboxSchema() {
+  return Schema()
+      .Add({Variable("Q6764", kColumnBinary), Variable("S3001", kColumnText, kCodePageUnicode),
+            Variable("N66a0", kColumnBinary)})
+      .Columns();
 }
 
-Schema FolderSchema() {
-  Schema s;
-  s.Add({"L3602", kColumnLong, 0, Slot::kFixed});  // content count
-  s.Add({"L3603", kColumnLong, 0, Slot::kFixed});  // unread count
-  s.Add({"Q6748", kColumnBinary, 0, Slot::kVariable});
-  s.Add({"Q6749", kColumnBinary, 0, Slot::kVariable});
-  s.Add({"S3001", kColumnText, kCodePageUnicode, Slot::kVariable});
-  s.Add({"S3613", kColumnText, kCodePageWestern, Slot::kVariable});
-  s.Add(TimeColumn("T3007", TimeForm::kBinaryBigEndian, false));
-  s.Add({"Ne58", kColumnBinary, 0, Slot::kTagged});
-  s.Add({"N3616", kColumnBinary, 0, Slot::kTagged});
-  s.Seal();
-  return s;
+Columns FolderSchema() {
+  return Schema()
+      .Add({Fixed("L3602", kColumnLong),  // content count
+            Fixed("L3603", kColumnLong),  // unread count
+            Variable("Q6748", kColumnBinary), Variable("Q6749", kColumnBinary),
+            Variable("S3001", kColumnText, kCodePageUnicode),
+            Variable("S3613", kColumnText, kCodePageWestern),
+            TimeColumn("T3007", TimeForm::kBinaryBigEndian, false), Tagged("Ne58", kColumnBinary),
+            Tagged("N3616", kColumnBinary)})
+      .Columns();
 }
 
 // The columns a folder's list shows, shared by "Msg" and the content tables.
-void AddListColumns(Schema* s, int version) {
+Schema ListSchema(int version) {
   const ListTimeForms times = ListTimes(version);
-  s->Add({"Le07", kColumnLong, 0, Slot::kFixed});
-  s->Add({"L17", kColumnLong, 0, Slot::kFixed});
-  s->Add({"Be1b", kColumnBit, 0, Slot::kFixed});
-  s->Add(TimeColumn("T3007", times.created, false));
-  s->Add(TimeColumn("T3008", times.modified, false));
-  s->Add(TimeColumn("Te06", times.received, false));
-  s->Add({"N67b0", kColumnBinary, 0, Slot::kVariable});
-  s->Add({"S1a", kColumnText, kCodePageWestern, Slot::kVariable});
+  const Column prefix = Variable("S3d", kColumnText, kCodePageUnicode);
+  const Column subject = Variable("Se1d", kColumnText, kCodePageUnicode);
+  Schema s;
+  s.Add({Fixed("Le07", kColumnLong), Fixed("L17", kColumnLong), Fixed("Be1b", kColumnBit),
+         TimeColumn("T3007", times.created, false), TimeColumn("T3008", times.modified, false),
+         TimeColumn("Te06", times.received, false), Variable("N67b0", kColumnBinary),
+         Variable("S1a", kColumnText, kCodePageWestern)});
   if (version == kExchange2007) {
-    s->Add({"Se1d", kColumnText, kCodePageUnicode, Slot::kVariable});
-    s->Add({"S3d", kColumnText, kCodePageUnicode, Slot::kVariable});
+    s.Add({subject, prefix});
   } else {
-    s->Add({"S3d", kColumnText, kCodePageUnicode, Slot::kVariable});
-    s->Add({"Se1d", kColumnText, kCodePageUnicode, Slot::kVariable});
+    s.Add({prefix, subject});
   }
-  s->Add({"S42", kColumnText, version == kExchange55 ? kCodePageWestern : kCodePageUnicode,
-          Slot::kVariable});
-  s->Add({"S678e", kColumnText, kCodePageUnicode, Slot::kVariable});
-  s->Add({"Se04", kColumnText, kCodePageUnicode, Slot::kVariable});
+  return s.Add(
+      {Variable("S42", kColumnText, version == kExchange55 ? kCodePageWestern : kCodePageUnicode),
+       Variable("S678e", kColumnText, kCodePageUnicode),
+       Variable("Se04", kColumnText, kCodePageUnicode)});
 }
 
-Schema ContentSchema(int version) {
-  Schema s;
-  AddListColumns(&s, version);
-  s.Seal();
-  return s;
-}
-
-Schema MessageSchema(int version) {
-  Schema s;
-  AddListColumns(&s, version);
-  s.Add({"L3fde", kColumnLong, 0, Slot::kFixed});
-  s.Add({"S1000", kColumnLongText, kCodePageUnicode, Slot::kTagged});
-  s.Add({"N1013", kColumnLongBinary, 0, Slot::kTagged});
-  s.Add({"N1009", kColumnLongBinary, 0, Slot::kTagged});
-  s.Add({"S7d", kColumnLongText, kCodePageUnicode, Slot::kTagged});
+Columns MessageSchema(int version) {
+  Schema s = ListSchema(version);
+  s.Add({Fixed("L3fde", kColumnLong), Tagged("S1000", kColumnLongText, kCodePageUnicode),
+         Tagged("N1013", kColumnLongBinary), Tagged("N1009", kColumnLongBinary),
+         Tagged("S7d", kColumnLongText, kCodePageUnicode)});
   // Contacts.
   for (const char* name : {"S3a06", "S3a08", "S3a11", "S3a16", "S3a17", "S3a1c"}) {
-    s.Add({name, kColumnText, kCodePageUnicode, Slot::kTagged});
+    s.Add(Tagged(name, kColumnText, kCodePageUnicode));
   }
-  s.Add(TimeColumn("T3a42", TimeForm::kLongLong, true));
-  s.Add({"I3a4d", kColumnShort, 0, Slot::kTagged});
+  s.Add({TimeColumn("T3a42", TimeForm::kLongLong, true), Tagged("I3a4d", kColumnShort)});
   // Appointments and meeting requests.
-  s.Add({"L805c", kColumnLong, 0, Slot::kTagged});
-  s.Add({"S810c", kColumnText, kCodePageUnicode, Slot::kTagged});
-  s.Add(TimeColumn("T814e", TimeForm::kCurrency, true));
-  s.Add(TimeColumn("T8198", TimeForm::kBinaryBigEndian, true));
+  s.Add({Tagged("L805c", kColumnLong), Tagged("S810c", kColumnText, kCodePageUnicode),
+         TimeColumn("T814e", TimeForm::kCurrency, true),
+         TimeColumn("T8198", TimeForm::kBinaryBigEndian, true)});
   // Tasks.
-  s.Add({"L26", kColumnLong, 0, Slot::kTagged});
-  s.Add(TimeColumn("T8078", TimeForm::kBinaryBigEndian, true));
-  s.Add(TimeColumn("T8079", TimeForm::kBinaryBigEndian, true));
-  s.Add({"D8121", kColumnDouble, 0, Slot::kTagged});
-  s.Add({"B8124", kColumnBit, 0, Slot::kTagged});
-  s.Add({"L8138", kColumnLong, 0, Slot::kTagged});
-  s.Add({"S814a", kColumnText, kCodePageUnicode, Slot::kTagged});
+  s.Add({Tagged("L26", kColumnLong), TimeColumn("T8078", TimeForm::kBinaryBigEndian, true),
+         TimeColumn("T8079", TimeForm::kBinaryBigEndian, true), Tagged("D8121", kColumnDouble),
+         Tagged("B8124", kColumnBit), Tagged("L8138", kColumnLong),
+         Tagged("S814a", kColumnText, kCodePageUnicode)});
   // Distribution lists.
-  s.Add({"MN81a9", kColumnLongBinary, 0, Slot::kTagged});
-  s.Seal();
-  return s;
+  return s.Add(Tagged("MN81a9", kColumnLongBinary)).Columns();
 }
 
-Schema AttachmentSchema(int version) {
+Columns AttachmentSchema(int version) {
   Schema s;
-  s.Add({"L65f1", kColumnLong, 0, Slot::kFixed});
-  s.Add({version == kExchange55 ? "Q674a" : "Q3f88", kColumnBinary, 0, Slot::kVariable});
-  s.Add({"N67b0", kColumnBinary, 0, Slot::kVariable});
-  const Column display = {"S3001", kColumnText, kCodePageUnicode, Slot::kVariable};
-  const Column file = {"S3704", kColumnText, kCodePageWestern, Slot::kVariable};
+  s.Add({Fixed("L65f1", kColumnLong),
+         Variable(version == kExchange55 ? "Q674a" : "Q3f88", kColumnBinary),
+         Variable("N67b0", kColumnBinary)});
+  const Column display = Variable("S3001", kColumnText, kCodePageUnicode);
+  const Column file = Variable("S3704", kColumnText, kCodePageWestern);
   if (version == kExchange55) {
-    s.Add(display);
-    s.Add(file);
+    s.Add({display, file});
   } else {
-    s.Add(file);
-    s.Add(display);
+    s.Add({file, display});
   }
-  s.Add({"S3707", kColumnText, kCodePageUnicode, Slot::kTagged});
-  s.Add({"N3701", kColumnLongBinary, 0, Slot::kTagged});
-  s.Seal();
-  return s;
+  return s.Add({Tagged("S3707", kColumnText, kCodePageUnicode), Tagged("N3701", kColumnLongBinary)})
+      .Columns();
 }
 
-// ---- Values
-
-Bytes EncodeText(const ColumnLayout& c, const std::string& utf8) {
-  if (c.codepage == kCodePageUnicode) return Utf8ToUtf16LE(utf8);
-  const std::string bytes = Utf8ToCodePage(utf8, c.codepage);
-  return Bytes(bytes.begin(), bytes.end());
-}
-
-// What a reader gets back from the column: characters the code page lacks
-// come back as '?'.
+// What a reader gets back from a text column: characters the code page
+// lacks come back as '?'.
 std::string RoundTrip(const ColumnLayout& c, const std::string& utf8) {
   if (c.codepage == kCodePageUnicode) return utf8;
-  const Bytes b = EncodeText(c, utf8);
-  return CodePageToUtf8(ByteView(b), c.codepage);
+  const std::string bytes = Utf8ToCodePage(utf8, c.codepage);
+  return CodePageToUtf8(ByteView(reinterpret_cast<const uint8_t*>(bytes.data()), bytes.size()),
+                        c.codepage);
 }
-
-Bytes EncodeTime(const ColumnLayout& c, uint64_t filetime) {
-  Bytes b(kIdSize);
-  if (c.type == kColumnBinary) {
-    StoreU32BE(b.data(), uint32_t(filetime >> 32));
-    StoreU32BE(b.data() + 4, uint32_t(filetime));
-  } else {
-    StoreU64LE(b.data(), filetime);
-  }
-  return b;
-}
-
-Bytes Le64(uint64_t v) {
-  Bytes b(kIdSize);
-  StoreU64LE(b.data(), v);
-  return b;
-}
-
-Bytes NormalizedKey(const Bytes& eight) {
-  Bytes key;
-  key.reserve(eight.size() + 2);
-  key.push_back(kKeyPrefix);
-  key.insert(key.end(), eight.begin(), eight.end());
-  key.push_back(kKeySuffix);
-  return key;
-}
-
-void AppendUtf16z(Bytes* out, const std::string& utf8) {
-  const Bytes b = Utf8ToUtf16LE(utf8);
-  out->insert(out->end(), b.begin(), b.end());
-  out->push_back(0);
-  out->push_back(0);
-}
-
-Bytes EncodeMembers(const std::vector<ListMember>& members) {
-  Bytes out(kMemberListHeader);
-  StoreU32LE(out.data(), kMemberListHeader);
-  StoreU32LE(out.data() + 4, uint32_t(members.size()));
-  for (const ListMember& m : members) {
-    const size_t at = out.size();
-    out.resize(at + 4 + sizeof kOneOffProviderUid + 4, 0);
-    std::memcpy(out.data() + at + 4, kOneOffProviderUid, sizeof kOneOffProviderUid);
-    StoreU16LE(out.data() + at + 4 + sizeof kOneOffProviderUid + 2, kOneOffUnicode);
-    AppendUtf16z(&out, m.name);
-    AppendUtf16z(&out, m.address_type);
-    AppendUtf16z(&out, m.address);
-  }
-  return out;
-}
-
-// ---- Output
-
-// Pages go straight to the file, runs of consecutive pages in one write.
-class FilePageSink : public PageSink {
- public:
-  FilePageSink(int fd, uint32_t page_size) : fd_(fd), page_size_(page_size) {}
-  Status Put(uint32_t page_number, Bytes image) override {
-    if (!buffer_.empty() && page_number != first_ + buffer_.size() / page_size_) {
-      Status s = Flush();
-      if (!s.ok()) return s;
-    }
-    if (buffer_.empty()) first_ = page_number;
-    buffer_.insert(buffer_.end(), image.begin(), image.end());
-    return buffer_.size() >= kWriteBuffer ? Flush() : Status::Ok();
-  }
-  Status Flush() {
-    if (buffer_.empty()) return Status::Ok();
-    // Page n sits after the two header pages.
-    Status s = WriteAt(off_t(first_ + 1) * page_size_, buffer_.data(), buffer_.size());
-    buffer_.clear();
-    return s;
-  }
-  Status WriteAt(off_t offset, const uint8_t* data, size_t size) {
-    while (size > 0) {
-      const ssize_t n = pwrite(fd_, data, size, offset);
-      if (n <= 0) return Status::IoError(std::string("write failed: ") + std::strerror(errno));
-      data += n;
-      size -= size_t(n);
-      offset += n;
-    }
-    return Status::Ok();
-  }
-
- private:
-  int fd_;
-  uint32_t page_size_;
-  uint32_t first_ = 0;
-  Bytes buffer_;
-};
-
-// One table being streamed: its record tree and, optionally, its
-// long-value tree, both open until Finish.
-class StreamTable {
- public:
-  StreamTable(DatabaseWriter* db, std::string name, Schema schema, bool long_values,
-              uint32_t max_rows_per_leaf)
-      : db_(db), name_(std::move(name)), schema_(std::move(schema)) {
-    options_ = db->NewTree(0);
-    options_.max_entries_per_leaf = max_rows_per_leaf;
-    writer_ = std::make_unique<TreeWriter>(db->format(), options_, db->allocator(), db->sink());
-    if (long_values) {
-      lv_options_ = db->NewTree(kPageFlagLongValue);
-      lv_writer_ =
-          std::make_unique<TreeWriter>(db->format(), lv_options_, db->allocator(), db->sink());
-      chunk_size_ = DefaultLongValueChunkSize(db->format(), kLongValueIdSize);
-    }
-  }
-
-  const Schema& schema() const { return schema_; }
-  const std::string& name() const { return name_; }
-  uint64_t rows() const { return rows_; }
-
-  Status AddRow(Bytes key, const std::vector<Cell>& cells) {
-    TreeEntry e;
-    e.key = std::move(key);
-    Status s = EncodeRecord(schema_.columns(), cells, db_->layout(), &e.data);
-    if (s.ok()) s = writer_->Add(std::move(e));
-    if (!s.ok()) return Status::InvalidArgument(name_ + ": " + s.message());
-    ++rows_;
-    return s;
-  }
-
-  // Stores `data` in the long-value tree; the id goes in the record.
-  Status AddLongValue(Bytes data, uint64_t* id) {
-    if (!lv_writer_) return Status::InvalidArgument(name_ + " has no long-value tree");
-    LongValueLayout v;
-    v.id = next_lv_++;
-    v.data = std::move(data);
-    std::vector<TreeEntry> entries;
-    Status s =
-        AppendLongValueEntries(v, kLongValueIdSize, chunk_size_, std::nullopt, &entries, nullptr);
-    for (TreeEntry& e : entries) {
-      if (!s.ok()) break;
-      s = lv_writer_->Add(std::move(e));
-    }
-    *id = v.id;
-    return s;
-  }
-
-  Status Finish() {
-    TreeLayout layout, lv_layout;
-    Status s = writer_->Finish(&layout);
-    if (s.ok() && lv_writer_) s = lv_writer_->Finish(&lv_layout);
-    if (!s.ok()) return Status::InvalidArgument(name_ + ": " + s.message());
-    db_->AddTable(name_, schema_.columns(), options_, layout, lv_writer_ ? &lv_options_ : nullptr,
-                  lv_writer_ ? &lv_layout : nullptr);
-    return s;
-  }
-
- private:
-  DatabaseWriter* db_;
-  std::string name_;
-  Schema schema_;
-  TreeOptions options_, lv_options_;
-  std::unique_ptr<TreeWriter> writer_, lv_writer_;
-  uint32_t chunk_size_ = 0;
-  uint64_t next_lv_ = 1;
-  uint64_t rows_ = 0;
-};
-
-// Cells of one row, by column name.
-class Row {
- public:
-  Row(StreamTable* table, uint32_t long_value_limit, uint32_t record_budget)
-      : table_(table), limit_(long_value_limit), budget_(record_budget) {}
-
-  Status Put(const std::string& name, Bytes value) {
-    const ColumnLayout* c = Column(name);
-    if (!c) return Status::InvalidArgument(table_->name() + " has no column " + name);
-    used_ += value.size();
-    cells_.push_back({c->id, std::move(value), 0});
-    return Status::Ok();
-  }
-  Status Text(const std::string& name, const std::string& utf8) {
-    const ColumnLayout* c = Column(name);
-    if (!c) return Status::InvalidArgument(table_->name() + " has no column " + name);
-    return Put(name, EncodeText(*c, utf8));
-  }
-  Status Time(const std::string& name, uint64_t filetime) {
-    const ColumnLayout* c = Column(name);
-    if (!c) return Status::InvalidArgument(table_->name() + " has no column " + name);
-    return Put(name, EncodeTime(*c, filetime));
-  }
-  // A tagged value that goes to the long-value tree when it is large or
-  // the record is filling up. `separated` tells which happened.
-  Status Large(const std::string& name, Bytes value, bool* separated = nullptr) {
-    const ColumnLayout* c = Column(name);
-    if (!c) return Status::InvalidArgument(table_->name() + " has no column " + name);
-    const bool to_tree = value.size() > limit_ || used_ + value.size() > budget_;
-    if (separated) *separated = to_tree;
-    if (!to_tree) return Put(name, std::move(value));
-    uint64_t id = 0;
-    Status s = table_->AddLongValue(std::move(value), &id);
-    if (s.ok()) cells_.push_back(SeparatedCell(c->id, id));
-    return s;
-  }
-  const ColumnLayout* Column(const std::string& name) const { return table_->schema().Find(name); }
-  std::vector<Cell>& cells() { return cells_; }
-
- private:
-  StreamTable* table_;
-  uint32_t limit_;
-  uint32_t budget_;
-  size_t used_ = 0;
-  std::vector<Cell> cells_;
-};
 
 // ---- The store
 
@@ -506,7 +198,7 @@ class StoreWriter {
 Status StoreWriter::WriteMailboxes(StreamTable* table) {
   std::vector<size_t> order(content_.mailboxes.size());
   for (size_t i = 0; i < order.size(); ++i) order[i] = i;
-  auto key = [&](size_t i) { return NormalizedKey(Le64(content_.mailboxes[i].number)); };
+  auto key = [&](size_t i) { return BinaryKey(Le64(content_.mailboxes[i].number)); };
   std::sort(order.begin(), order.end(), [&](size_t a, size_t b) { return key(a) < key(b); });
   for (size_t r = 0; r < order.size(); ++r) {
     const ManifestMailbox& mb = content_.mailboxes[order[r]];
@@ -524,7 +216,7 @@ Status StoreWriter::WriteMailboxes(StreamTable* table) {
 Status StoreWriter::WriteFolders(StreamTable* table) {
   std::vector<size_t> order(content_.folders.size());
   for (size_t i = 0; i < order.size(); ++i) order[i] = i;
-  auto key = [&](size_t i) { return NormalizedKey(Le64(content_.folders[i].id)); };
+  auto key = [&](size_t i) { return BinaryKey(Le64(content_.folders[i].id)); };
   std::sort(order.begin(), order.end(), [&](size_t a, size_t b) { return key(a) < key(b); });
   for (size_t r = 0; r < order.size(); ++r) {
     const ManifestFolder& f = content_.folders[order[r]];
@@ -532,8 +224,8 @@ Status StoreWriter::WriteFolders(StreamTable* table) {
     Row row(table, limit_, budget_);
     uint32_t unread = 0;
     for (const ManifestItem& it : f.items) unread += (it.flags & 1) ? 0 : 1;
-    Status s = row.Put("L3602", LittleEndian(m.item_count, 4));
-    if (s.ok()) s = row.Put("L3603", LittleEndian(unread, 4));
+    Status s = row.Number("L3602", m.item_count);
+    if (s.ok()) s = row.Number("L3603", unread);
     if (s.ok()) s = row.Put("Q6748", Le64(f.id));
     if (s.ok()) s = row.Put("Q6749", Le64(f.parent));
     if (s.ok()) s = row.Text("S3001", f.name);
@@ -548,34 +240,18 @@ Status StoreWriter::WriteFolders(StreamTable* table) {
   return Status::Ok();
 }
 
+// The list columns; "Se04" shows the To line too.
 Status StoreWriter::ListCells(Row* row, const ManifestItem& item) {
-  Status s = row->Put("N67b0", item.key);
-  auto next = [&](Status st) {
-    if (s.ok()) s = st;
-  };
-  next(row->Text("S1a", item.message_class));
-  if (!item.subject_prefix.empty()) next(row->Text("S3d", item.subject_prefix));
-  next(row->Text("Se1d", item.normalized_subject));
-  if (!item.sender.empty()) next(row->Text("S42", item.sender));
-  if (!item.to.empty()) {
-    next(row->Text("S678e", item.to));
-    next(row->Text("Se04", item.to));
-  }
-  next(row->Time("T3007", item.created));
-  next(row->Time("T3008", item.modified));
-  next(row->Time("Te06", item.received));
-  next(row->Put("Le07", LittleEndian(item.flags, 4)));
-  next(row->Put("L17", LittleEndian(item.importance, 4)));
-  next(row->Put("Be1b", Bytes{uint8_t(item.has_attachments ? kBitTrue : 0)}));
+  Status s = PutListColumns(row, item);
+  if (s.ok() && !item.to.empty()) s = row->Text("Se04", item.to);
   return s;
 }
 
 Status StoreWriter::WriteItem(size_t folder, ManifestItem item) {
   const int version = options_.version;
   // What a reader sees of the 1252 columns.
-  const ColumnLayout* sender = msg_->schema().Find("S42");
-  item.sender = RoundTrip(*sender, item.sender);
-  item.message_class = RoundTrip(*msg_->schema().Find("S1a"), item.message_class);
+  item.sender = RoundTrip(*msg_->Find("S42"), item.sender);
+  item.message_class = RoundTrip(*msg_->Find("S1a"), item.message_class);
   item.subject = item.subject_prefix + item.normalized_subject;
   item.to_shown = version == kExchange55 ? "" : item.to;
   item.sender_shown = version == kExchange55 ? "" : item.sender;
@@ -584,7 +260,7 @@ Status StoreWriter::WriteItem(size_t folder, ManifestItem item) {
   StreamTable* list = content_tables_[folder].get();
   Row list_row(list, limit_, budget_);
   Status s = ListCells(&list_row, item);
-  if (s.ok()) s = list->AddRow(NormalizedKey(item.key), list_row.cells());
+  if (s.ok()) s = list->AddRow(BinaryKey(item.key), list_row.cells());
   if (!s.ok()) return s;
 
   if (item.in_msg_table) {
@@ -593,41 +269,8 @@ Status StoreWriter::WriteItem(size_t folder, ManifestItem item) {
     auto next = [&](Status st) {
       if (s.ok()) s = st;
     };
-    next(row.Put("L3fde", LittleEndian(kInternetCodePageUtf8, 4)));
-    bool separated = false;
-    if (!item.body_text.empty()) {
-      next(row.Large("S1000", Utf8ToUtf16LE(item.body_text), &separated));
-      item.body_long_value |= separated;
-    }
-    if (!item.body_html.empty()) {
-      next(row.Large("N1013", Bytes(item.body_html.begin(), item.body_html.end()), &separated));
-      item.body_long_value |= separated;
-    }
-    if (!item.rtf_text.empty()) {
-      Bytes rtf = item.rtf_uses_references ? EncodeRtfCompressed(item.rtf_text)
-                                           : EncodeRtfLiteral(item.rtf_text);
-      next(row.Large("N1009", std::move(rtf), &separated));
-      item.body_long_value |= separated;
-    }
-    if (!item.headers.empty()) next(row.Large("S7d", Utf8ToUtf16LE(item.headers)));
-    for (const auto& [name, value] : item.strings) next(row.Text(name, value));
-    for (const auto& [name, value] : item.times) next(row.Time(name, value));
-    for (const auto& [name, value] : item.numbers) {
-      const ColumnLayout* c = row.Column(name);
-      if (!c) {
-        next(Status::InvalidArgument("Msg has no column " + name));
-        continue;
-      }
-      const size_t width = c->type == kColumnBit ? 1 : c->type == kColumnShort ? 2 : 4;
-      next(row.Put(name, LittleEndian(uint64_t(value), width)));
-    }
-    for (const auto& [name, value] : item.doubles) {
-      uint64_t bits;
-      std::memcpy(&bits, &value, sizeof bits);
-      next(row.Put(name, LittleEndian(bits, 8)));
-    }
-    if (!item.members.empty()) next(row.Large("MN81a9", EncodeMembers(item.members)));
-    if (s.ok()) s = msg_->AddRow(NormalizedKey(item.key), row.cells());
+    next(PutPropertyColumns(&row, &item));
+    if (s.ok()) s = msg_->AddRow(BinaryKey(item.key), row.cells());
     if (!s.ok()) return s;
     ++manifest_->messages;
 
@@ -642,7 +285,7 @@ Status StoreWriter::WriteItem(size_t folder, ManifestItem item) {
       copy.normalized_subject = subject;
       Row dup(msg_, limit_, budget_);
       s = ListCells(&dup, copy);
-      Bytes key = NormalizedKey(item.key);
+      Bytes key = BinaryKey(item.key);
       key.push_back(kDuplicateKeyTail);
       if (s.ok()) s = msg_->AddRow(std::move(key), dup.cells());
       if (!s.ok()) return s;
@@ -655,23 +298,22 @@ Status StoreWriter::WriteItem(size_t folder, ManifestItem item) {
       Row arow(attachments_, limit_, budget_);
       s = arow.Put(manifest_->attachment_key_column, a.key);
       next(arow.Put("N67b0", item.key));
-      next(arow.Put("L65f1", LittleEndian(a.method, 4)));
-      const ColumnLayout* file = attachments_->schema().Find("S3704");
-      a.file_name = RoundTrip(*file, a.file_name);
+      next(arow.Number("L65f1", a.method));
+      a.file_name = RoundTrip(*attachments_->Find("S3704"), a.file_name);
       if (!a.display_name.empty()) next(arow.Text("S3001", a.display_name));
       if (!a.file_name.empty()) next(arow.Text("S3704", a.file_name));
       if (!a.long_file_name.empty()) next(arow.Text("S3707", a.long_file_name));
       // The name a reader keeps: the first non-empty of the two in column order.
       a.name.clear();
-      for (const ColumnLayout& c : attachments_->schema().columns()) {
+      for (const ColumnLayout& c : attachments_->columns()) {
         if (!a.name.empty()) break;
         if (c.name == "S3001") a.name = a.display_name;
         if (c.name == "S3704") a.name = a.file_name;
       }
       a.size = a.data.size();
       if (manifest_->items_recorded) a.sha256 = Sha256Hex(ByteView(a.data));
-      next(arow.Large("N3701", a.data, &a.long_value));
-      if (s.ok()) s = attachments_->AddRow(NormalizedKey(a.key), arow.cells());
+      next(arow.Large("N3701", a.data, Compression::kNone, &a.long_value));
+      if (s.ok()) s = attachments_->AddRow(BinaryKey(a.key), arow.cells());
       if (!s.ok()) return s;
       ++manifest_->attachment_rows;
     }
@@ -793,28 +435,31 @@ Status StoreWriter::Write(const std::string& path) {
   }
   for (size_t i = 0; i < m.folders.size(); ++i) m.folders[i].item_count += bulk_counts[i];
 
-  const int fd = open(path.c_str(), O_CREAT | O_TRUNC | O_WRONLY, 0644);
-  if (fd < 0) return Status::IoError("cannot create " + path);
-  FilePageSink sink(fd, layout.page_size);
-  Status s = [&]() -> Status {
-    DatabaseWriter db(layout, &sink);
+  DatabaseFile file(layout.page_size);
+  Status s = file.Create(path);
+  if (!s.ok()) return s;
+  s = [&]() -> Status {
+    DatabaseWriter db(layout, &file);
     if (!db.status().ok()) return db.status();
-    StreamTable mailbox(&db, "Mailbox", MailboxSchema(), false, 0);
-    StreamTable folders(&db, "Folders", FolderSchema(), false, 0);
-    StreamTable msg(&db, "Msg", MessageSchema(version), true, options_.max_rows_per_leaf);
-    StreamTable attach(&db, m.attachment_table, AttachmentSchema(version), true,
-                       options_.max_rows_per_leaf);
+    const uint32_t leaf = options_.max_rows_per_leaf;
+    StreamTable mailbox(&db, "Mailbox", MailboxSchema(), {});
+    StreamTable folders(&db, "Folders", FolderSchema(), {});
+    StreamTable msg(&db, "Msg", MessageSchema(version),
+                    {.long_values = true, .max_rows_per_leaf = leaf});
+    StreamTable attach(&db, m.attachment_table, AttachmentSchema(version),
+                       {.long_values = true, .max_rows_per_leaf = leaf});
     msg_ = &msg;
     attachments_ = &attach;
     for (const ManifestFolder& f : m.folders) {
-      content_tables_.push_back(std::make_unique<StreamTable>(
-          &db, f.content_table, ContentSchema(version), false, options_.max_rows_per_leaf));
+      content_tables_.push_back(
+          std::make_unique<StreamTable>(&db, f.content_table, ListSchema(version).Columns(),
+                                        StreamTableOptions{.max_rows_per_leaf = leaf}));
     }
-    for (const auto& [table, schema] :
-         {std::pair{std::string("Msg"), &msg.schema()},
-          std::pair{std::string("Content"), &content_tables_.front()->schema()},
-          std::pair{std::string("Folders"), &folders.schema()}}) {
-      for (const ColumnLayout& c : schema->columns()) {
+    for (const auto& [table, columns] :
+         {std::pair{std::string("Msg"), &msg.columns()},
+          std::pair{std::string("Content"), &content_tables_.front()->columns()},
+          std::pair{std::string("Folders"), &folders.columns()}}) {
+      for (const ColumnLayout& c : *columns) {
         if (c.name[0] == 'T') m.time_encodings[table + "." + c.name] = TimeFormName(c.type);
       }
     }
@@ -851,19 +496,11 @@ Status StoreWriter::Write(const std::string& path) {
       st = t->Finish();
       if (!st.ok()) return st;
     }
-    Bytes header;
     Manifest pages;
-    st = db.Finish(&header, &pages);
-    if (st.ok()) st = sink.Flush();
-    if (st.ok()) st = sink.WriteAt(0, header.data(), header.size());
-    if (st.ok()) st = sink.WriteAt(layout.page_size, header.data(), header.size());
-    const off_t size = off_t(db.total_pages() + 2) * layout.page_size;
-    if (st.ok() && ftruncate(fd, size) != 0) st = Status::IoError("cannot size " + path);
-    return st;
+    return file.Finish(&db, &pages);
   }();
   content_tables_.clear();
-  if (close(fd) != 0 && s.ok()) s = Status::IoError("cannot write " + path);
-  return s;
+  return file.Close(s);
 }
 
 }  // namespace

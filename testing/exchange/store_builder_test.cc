@@ -5,147 +5,14 @@
 
 #include <gtest/gtest.h>
 
-#include <cstdlib>
-#include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <map>
-#include <memory>
-#include <sstream>
 
-#include "base/paths.h"
-#include "base/text.h"
-#include "engine/column_decoder.h"
-#include "engine/edb_class.h"
-#include "store/rtf_decompressor.h"
+#include "testing/exchange/store_test_support.h"
 
 namespace tarnwell::forge::exchange {
 namespace {
-
-using engine::DecodedColumn;
-using Kind = DecodedColumn::Kind;
-using Row = std::map<std::string, DecodedColumn>;
-
-constexpr uint32_t kCatalogPage = 4;
-
-struct Table {
-  std::vector<std::string> columns;  // catalog order
-  std::vector<Row> rows;             // table order
-};
-
-class Store {
- public:
-  Store(const LegacyStoreOptions& options) {
-    EXPECT_TRUE(MakeTempDir("tarnwell-store-forge", &dir_).ok());
-    path_ = dir_ + "/store.edb";
-    Status s = BuildLegacyStore(options, path_, &manifest_);
-    EXPECT_TRUE(s.ok()) << s.ToString();
-    reader_ = engine::MakeReader(options.version);
-    EXPECT_TRUE(reader_->OpenDatabase(path_, engine::SourceDescriptor{}, options.version));
-    EXPECT_EQ(reader_->CollectTreeRecords(kCatalogPage), 1);
-    reader_->ParseCatalogRecords();
-  }
-  ~Store() { std::filesystem::remove_all(dir_); }
-
-  const StoreManifest& manifest() const { return manifest_; }
-  const std::string& path() const { return path_; }
-  engine::EdbClass& reader() { return *reader_; }
-
-  Table Read(const std::string& name) {
-    Table t;
-    const engine::TableDef* def = reader_->FindTable(name);
-    EXPECT_NE(def, nullptr) << name;
-    if (!def) return t;
-    for (const engine::CatalogEntry& c : def->columns) t.columns.push_back(c.name);
-    const engine::LongValueReader lvs = reader_->long_values();
-    const engine::ColumnDecoder decoder(&lvs, def->long_value ? def->long_value->root_page() : 0);
-    EXPECT_EQ(reader_->ForEachRecord(*def,
-                                     [&](const engine::RecordRef&, engine::RecordColumns& cols) {
-                                       Row row;
-                                       for (size_t i = 0; i < def->columns.size(); ++i) {
-                                         DecodedColumn d =
-                                             decoder.Decode(def->columns[i], cols.at(i));
-                                         if (d.kind != Kind::kAbsent) {
-                                           row[def->columns[i].name] = std::move(d);
-                                         }
-                                       }
-                                       t.rows.push_back(std::move(row));
-                                       return true;
-                                     }),
-              1)
-        << name;
-    return t;
-  }
-
- private:
-  std::string dir_, path_;
-  StoreManifest manifest_;
-  std::unique_ptr<engine::EdbClass> reader_;
-};
-
-std::string Text(const Row& row, const std::string& name) {
-  auto it = row.find(name);
-  if (it == row.end()) return "";
-  EXPECT_EQ(it->second.kind, Kind::kText) << name << ": " << it->second.text;
-  return it->second.text;
-}
-
-Bytes Blob(const Row& row, const std::string& name) {
-  auto it = row.find(name);
-  if (it == row.end()) return {};
-  EXPECT_EQ(it->second.kind, Kind::kBinary) << name << ": " << it->second.text;
-  return it->second.bytes;
-}
-
-uint64_t Number(const Row& row, const std::string& name) {
-  auto it = row.find(name);
-  if (it == row.end()) return UINT64_MAX;
-  const DecodedColumn& d = it->second;
-  if (d.kind == Kind::kSigned) return uint64_t(d.i);
-  if (d.kind == Kind::kUnsigned) return d.u;
-  if (d.kind == Kind::kBool) return d.b ? 1 : 0;
-  ADD_FAILURE() << name << " is not a number";
-  return UINT64_MAX;
-}
-
-// A time in whatever form the column has: 64-bit integers little-endian,
-// 8-byte binary big-endian.
-uint64_t Time(const Row& row, const std::string& name) {
-  auto it = row.find(name);
-  if (it == row.end()) return 0;
-  if (it->second.kind == Kind::kBinary) {
-    const Bytes& b = it->second.bytes;
-    EXPECT_EQ(b.size(), 8u) << name;
-    return b.size() == 8 ? LoadU64BE(b.data()) : 0;
-  }
-  return Number(row, name);
-}
-
-uint64_t Le(const Bytes& b) { return b.size() == 8 ? LoadU64LE(b.data()) : 0; }
-
-std::string Utf16z(const Bytes& b, size_t* at) {
-  size_t end = *at;
-  while (end + 1 < b.size() && (b[end] | b[end + 1])) end += 2;
-  std::string s = Utf16LEToUtf8(ByteView(b.data() + *at, end - *at));
-  *at = end + 2;
-  return s;
-}
-
-// The member list as its header comment documents it.
-std::vector<ListMember> Members(const Bytes& b) {
-  std::vector<ListMember> out;
-  if (b.size() < 8) return out;
-  constexpr size_t kMemberHeader = 24;
-  for (size_t at = LoadU32LE(b.data()); at + kMemberHeader < b.size();) {
-    at += kMemberHeader;
-    ListMember m;
-    m.name = Utf16z(b, &at);
-    m.address_type = Utf16z(b, &at);
-    m.address = Utf16z(b, &at);
-    out.push_back(m);
-  }
-  return out;
-}
 
 struct StoreCase {
   int version;
@@ -171,7 +38,7 @@ LegacyStoreOptions OptionsFor(const StoreCase& c) {
 
 class StoreReadBackTest : public ::testing::TestWithParam<StoreCase> {};
 
-TEST_P(StoreReadBackTest, CatalogHoldsEveryTableTheManifestNames) {
+TEST_P(StoreReadBackTest, EveryTableRowAndValueMatchesTheManifest) {
   Store store(OptionsFor(GetParam()));
   const StoreManifest& m = store.manifest();
   std::vector<std::string> expected = {"MSysObjects", "MSysObjectsShadow", "Mailbox", "Folders",
@@ -189,11 +56,7 @@ TEST_P(StoreReadBackTest, CatalogHoldsEveryTableTheManifestNames) {
   EXPECT_EQ(m.attachment_table, GetParam().public_store   ? "1-A"
                                 : GetParam().version == 1 ? "1-23"
                                                           : "1-24");
-}
 
-TEST_P(StoreReadBackTest, MailboxAndFolderRowsMatch) {
-  Store store(OptionsFor(GetParam()));
-  const StoreManifest& m = store.manifest();
   const Table mailboxes = store.Read("Mailbox");
   ASSERT_EQ(mailboxes.rows.size(), m.mailboxes.size());
   for (const ManifestMailbox& mb : m.mailboxes) {
@@ -213,11 +76,7 @@ TEST_P(StoreReadBackTest, MailboxAndFolderRowsMatch) {
     EXPECT_FALSE(Text(row, "S3613").empty()) << f.name;
     EXPECT_EQ(Number(row, "L3602"), f.item_count) << f.name;
   }
-}
 
-TEST_P(StoreReadBackTest, MessagesContentTablesAndAttachmentsMatch) {
-  Store store(OptionsFor(GetParam()));
-  const StoreManifest& m = store.manifest();
   const Table msg = store.Read("Msg");
   EXPECT_EQ(msg.rows.size(), m.msg_rows);
   EXPECT_EQ(m.msg_rows, m.messages + m.duplicates.size());
@@ -254,57 +113,15 @@ TEST_P(StoreReadBackTest, MessagesContentTablesAndAttachmentsMatch) {
     for (size_t i = 0; i < f.items.size(); ++i) {
       const ManifestItem& it = f.items[i];
       SCOPED_TRACE(f.name + " / " + it.subject);
-      const Row& list = content.rows[i];
-      EXPECT_EQ(Blob(list, "N67b0"), it.key);
-      EXPECT_EQ(Text(list, "S3d") + Text(list, "Se1d"), it.subject);
-      EXPECT_EQ(Text(list, "S42"), it.sender);
-      EXPECT_EQ(Text(list, "S678e"), it.to);
-      EXPECT_EQ(Text(list, "S1a"), it.message_class);
-      EXPECT_EQ(Time(list, "T3007"), it.created);
-      EXPECT_EQ(Time(list, "T3008"), it.modified);
-      EXPECT_EQ(Time(list, "Te06"), it.received);
-      EXPECT_EQ(Number(list, "Le07"), it.flags);
-      EXPECT_EQ(Number(list, "L17"), it.importance);
-      EXPECT_EQ(Number(list, "Be1b"), it.has_attachments ? 1u : 0u);
+      ExpectListColumns(content.rows[i], it);
 
       auto found = by_key.find(it.key);
       ASSERT_EQ(found != by_key.end(), it.in_msg_table);
       if (!it.in_msg_table) continue;
       ++items;
       const Row& row = *found->second;
-      EXPECT_EQ(Text(row, "S3d") + Text(row, "Se1d"), it.subject);
-      EXPECT_EQ(Time(row, "Te06"), it.received);
-      EXPECT_EQ(Text(row, "S1000"), it.body_text);
-      const Bytes html = Blob(row, "N1013");
-      EXPECT_EQ(std::string(html.begin(), html.end()), it.body_html);
-      EXPECT_EQ(Text(row, "S7d"), it.headers);
-      const Bytes rtf = Blob(row, "N1009");
-      if (it.rtf_text.empty()) {
-        EXPECT_TRUE(rtf.empty());
-      } else {
-        EXPECT_EQ(store::CheckRtfCrc(ByteView(rtf)), store::RtfCrcStatus::kMatch);
-        const auto text = store::DecompressRtf(ByteView(rtf));
-        ASSERT_TRUE(text.has_value());
-        const ByteView body = text->body();
-        EXPECT_EQ(std::string(reinterpret_cast<const char*>(body.data()), body.size()),
-                  it.rtf_text);
-      }
-      for (const auto& [name, value] : it.strings) EXPECT_EQ(Text(row, name), value) << name;
-      for (const auto& [name, value] : it.times) EXPECT_EQ(Time(row, name), value) << name;
-      for (const auto& [name, value] : it.numbers) {
-        EXPECT_EQ(Number(row, name), uint64_t(value)) << name;
-      }
-      for (const auto& [name, value] : it.doubles) {
-        ASSERT_TRUE(row.count(name)) << name;
-        EXPECT_EQ(row.at(name).d, value) << name;
-      }
-      const std::vector<ListMember> members = Members(Blob(row, "MN81a9"));
-      ASSERT_EQ(members.size(), it.members.size());
-      for (size_t k = 0; k < members.size(); ++k) {
-        EXPECT_EQ(members[k].name, it.members[k].name);
-        EXPECT_EQ(members[k].address_type, it.members[k].address_type);
-        EXPECT_EQ(members[k].address, it.members[k].address);
-      }
+      ExpectListColumns(row, it);
+      ExpectPropertyColumns(row, it);
 
       const std::vector<const Row*>& rows = attachments_of[it.key];
       ASSERT_EQ(rows.size(), it.attachments.size());
@@ -349,13 +166,6 @@ TEST(ContentNameTest, FollowsTheLastRunOfFourZeros) {
     EXPECT_EQ(ContentName(c.id), c.name) << std::hex << c.id;
     EXPECT_EQ(ContentTableName(c.id), std::string("1-") + c.name);
   }
-}
-
-const ManifestFolder* FindFolder(const StoreManifest& m, const std::string& name) {
-  for (const ManifestFolder& f : m.folders) {
-    if (f.name == name) return &f;
-  }
-  return nullptr;
 }
 
 TEST(StoreManifestTest, TreeFactsOfThePrivateStore) {
@@ -438,11 +248,6 @@ TEST(StoreManifestTest, JsonIsValidAndCarriesTheCounts) {
   EXPECT_EQ(std::system(check.c_str()), 0);
 }
 
-Bytes FileBytes(const std::string& path) {
-  std::ifstream in(path, std::ios::binary);
-  return Bytes(std::istreambuf_iterator<char>(in), {});
-}
-
 TEST(StoreBuilderTest, OutputIsDeterministic) {
   LegacyStoreOptions o;
   o.version = 4;
@@ -450,7 +255,7 @@ TEST(StoreBuilderTest, OutputIsDeterministic) {
   o.bulk.messages = 300;
   o.bulk.seed = 7;
   Store a(o), b(o);
-  EXPECT_EQ(FileBytes(a.path()), FileBytes(b.path()));
+  EXPECT_TRUE(ReadFileText(a.path()) == ReadFileText(b.path()));
   EXPECT_EQ(ManifestJson(a.manifest()), ManifestJson(b.manifest()));
   o.bulk.seed = 8;
   Store c(o);
@@ -479,16 +284,20 @@ TEST(StoreBuilderTest, BulkMailFillsOneLargeFolderAndCountsWithoutItems) {
   EXPECT_GT(m.attachment_rows, 4000u / 4 - 1);
 }
 
-TEST(StoreBuilderTest, RejectsUnknownVersions) {
-  std::string dir;
-  ASSERT_TRUE(MakeTempDir("tarnwell-store-forge", &dir).ok());
+TEST(StoreBuilderTest, RejectsUnknownVersionsAndUnwritablePaths) {
+  ScratchDir dir("store_forge");
+  StoreManifest m;
   for (int version : {0, 3, 5}) {
     LegacyStoreOptions o;
     o.version = version;
-    StoreManifest m;
-    EXPECT_FALSE(BuildLegacyStore(o, dir + "/x.edb", &m).ok()) << version;
+    EXPECT_FALSE(BuildLegacyStore(o, dir / "x.edb", &m).ok()) << version;
   }
-  std::filesystem::remove_all(dir);
+  EXPECT_FALSE(BuildLegacyStore({}, "/nonexistent-dir/x.edb", &m).ok());
+  ModernStoreOptions modern;
+  EXPECT_FALSE(BuildModernStore(modern, "/nonexistent-dir/x.edb", &m).ok());
+  modern.version = kExchange2010;
+  modern.real_layout = true;
+  EXPECT_FALSE(BuildModernStore(modern, dir / "x.edb", &m).ok()) << "the real layout is code 5";
 }
 
 }  // namespace

@@ -8,41 +8,17 @@
 // "Folders" cannot be exported; esedbinfo still lists them with their
 // columns. The other tables are exported one at a time.
 #include <gtest/gtest.h>
-#include <unistd.h>
 
-#include <cstdlib>
+#include <algorithm>
 #include <filesystem>
-#include <fstream>
-#include <sstream>
 #include <string>
 #include <vector>
 
-#include "base/paths.h"
 #include "testing/exchange/store_builder.h"
+#include "testing/forge_test_support.h"
 
 namespace tarnwell::forge::exchange {
 namespace {
-
-namespace fs = std::filesystem;
-
-bool HaveTool(const char* name) {
-  return std::system((std::string("command -v ") + name + " >/dev/null 2>&1").c_str()) == 0;
-}
-
-std::string ReadText(const fs::path& path) {
-  std::ifstream in(path, std::ios::binary);
-  std::stringstream ss;
-  ss << in.rdbuf();
-  return ss.str();
-}
-
-std::vector<std::string> Split(const std::string& text, char sep) {
-  std::vector<std::string> out;
-  std::string field;
-  std::istringstream in(text);
-  while (std::getline(in, field, sep)) out.push_back(field);
-  return out;
-}
 
 class StoreEsedbTest : public ::testing::TestWithParam<int> {
  protected:
@@ -50,30 +26,27 @@ class StoreEsedbTest : public ::testing::TestWithParam<int> {
     if (!HaveTool("esedbexport") || !HaveTool("esedbinfo")) {
       GTEST_SKIP() << "esedbinfo/esedbexport (Debian libesedb-utils) not installed";
     }
-    ASSERT_TRUE(MakeTempDir("tarnwell-store-esedb", &dir_).ok());
-  }
-  void TearDown() override {
-    if (!dir_.empty() && !HasFailure()) fs::remove_all(dir_);
   }
 
   // The rows of one table as esedbexport prints them; the first line is the
   // column names.
   std::vector<std::vector<std::string>> Export(const std::string& edb, const std::string& table) {
-    const fs::path target = fs::path(dir_) / ("t" + std::to_string(++exports_));
-    const fs::path log = target.string() + ".log";
-    const std::string cmd = "esedbexport -T '" + table + "' -t '" + target.string() + "' '" + edb +
-                            "' >'" + log.string() + "' 2>&1 </dev/null";
-    EXPECT_EQ(std::system(cmd.c_str()), 0) << table << "\n" << ReadText(log);
+    const std::string target = dir_ / ("t" + std::to_string(++exports_));
+    EXPECT_EQ(RunTool("esedbexport -T '" + table + "' -t '" + target + "' '" + edb + "'",
+                      target + ".log"),
+              0)
+        << table << "\n"
+        << ReadFileText(target + ".log");
     std::vector<std::vector<std::string>> rows;
-    for (const auto& entry : fs::directory_iterator(target.string() + ".export")) {
-      for (const std::string& line : Split(ReadText(entry.path()), '\n')) {
-        rows.push_back(Split(line, '\t'));
+    for (const auto& entry : std::filesystem::directory_iterator(target + ".export")) {
+      for (const std::string& line : SplitText(ReadFileText(entry.path()), '\n')) {
+        rows.push_back(SplitText(line, '\t'));
       }
     }
     return rows;
   }
 
-  std::string dir_;
+  ScratchDir dir_{"store_esedb"};
   int exports_ = 0;
 };
 
@@ -94,14 +67,13 @@ TEST_P(StoreEsedbTest, LibesedbFindsTheTablesRowsAndKeys) {
   options.version = GetParam();
   options.damage = DamageOptions::All();
   options.bulk.messages = 200;
-  const std::string edb = dir_ + "/store.edb";
+  const std::string edb = dir_ / "store.edb";
   StoreManifest m;
   ASSERT_TRUE(BuildLegacyStore(options, edb, &m).ok());
 
-  const std::string log = dir_ + "/esedbinfo.log";
-  ASSERT_EQ(std::system(("esedbinfo '" + edb + "' >'" + log + "' 2>&1").c_str()), 0)
-      << ReadText(log);
-  const std::string info = ReadText(log);
+  const std::string log = dir_ / "esedbinfo.log";
+  ASSERT_EQ(RunTool("esedbinfo '" + edb + "'", log), 0) << ReadFileText(log);
+  const std::string info = ReadFileText(log);
   EXPECT_NE(info.find("Page size:\t\t" + std::to_string(m.page_size) + " bytes"),
             std::string::npos);
   EXPECT_NE(info.find("Number of tables:\t" + std::to_string(m.folders.size() + 6)),

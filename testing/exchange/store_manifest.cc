@@ -29,6 +29,25 @@ constexpr IconRule kIconRules[] = {
 
 std::string Hex(const Bytes& b) { return ToHex(ByteView(b)); }
 
+// `key`: an object of the map's entries, each value written by `put`.
+template <typename Map, typename Put>
+void MapObject(JsonWriter& w, const char* key, const Map& map, Put put) {
+  w.Key(key).BeginObject();
+  for (const auto& [k, v] : map) put(w.Key(k), v);
+  w.EndObject();
+}
+
+void KeySubjects(JsonWriter& w, const char* key, const std::vector<DuplicateRow>& rows) {
+  w.Key(key).BeginArray();
+  for (const DuplicateRow& d : rows) {
+    w.BeginObject();
+    w.Key("key").String(Hex(d.key));
+    w.Key("subject").String(d.subject);
+    w.EndObject();
+  }
+  w.EndArray();
+}
+
 void Attachment(JsonWriter& w, const ManifestAttachment& a) {
   w.BeginObject();
   w.Key("key").String(Hex(a.key));
@@ -67,18 +86,10 @@ void Item(JsonWriter& w, const ManifestItem& it) {
   w.Key("rtf_uses_references").Bool(it.rtf_uses_references);
   w.Key("body_long_value").Bool(it.body_long_value);
   w.Key("headers").String(it.headers);
-  w.Key("strings").BeginObject();
-  for (const auto& [k, v] : it.strings) w.Key(k).String(v);
-  w.EndObject();
-  w.Key("times").BeginObject();
-  for (const auto& [k, v] : it.times) w.Key(k).Uint(v);
-  w.EndObject();
-  w.Key("numbers").BeginObject();
-  for (const auto& [k, v] : it.numbers) w.Key(k).Int(v);
-  w.EndObject();
-  w.Key("doubles").BeginObject();
-  for (const auto& [k, v] : it.doubles) w.Key(k).Double(v);
-  w.EndObject();
+  MapObject(w, "strings", it.strings, [](JsonWriter& v, const auto& x) { v.String(x); });
+  MapObject(w, "times", it.times, [](JsonWriter& v, auto x) { v.Uint(x); });
+  MapObject(w, "numbers", it.numbers, [](JsonWriter& v, auto x) { v.Int(x); });
+  MapObject(w, "doubles", it.doubles, [](JsonWriter& v, auto x) { v.Double(x); });
   w.Key("members").BeginArray();
   for (const ListMember& m : it.members) {
     w.BeginObject();
@@ -150,9 +161,8 @@ std::string ManifestJson(const StoreManifest& m) {
   w.Key("revision").Uint(m.revision);
   w.Key("attachment_table").String(m.attachment_table);
   w.Key("attachment_key_column").String(m.attachment_key_column);
-  w.Key("time_encodings").BeginObject();
-  for (const auto& [k, v] : m.time_encodings) w.Key(k).String(v);
-  w.EndObject();
+  MapObject(w, "time_encodings", m.time_encodings,
+            [](JsonWriter& v, const auto& x) { v.String(x); });
   w.Key("mailboxes").BeginArray();
   for (const ManifestMailbox& mb : m.mailboxes) {
     w.BeginObject();
@@ -171,24 +181,10 @@ std::string ManifestJson(const StoreManifest& m) {
   w.Key("folders").BeginArray();
   for (const ManifestFolder& f : m.folders) Folder(w, f);
   w.EndArray();
-  w.Key("duplicates").BeginArray();
-  for (const DuplicateRow& d : m.duplicates) {
-    w.BeginObject();
-    w.Key("key").String(Hex(d.key));
-    w.Key("subject").String(d.subject);
-    w.EndObject();
-  }
-  w.EndArray();
+  KeySubjects(w, "duplicates", m.duplicates);
   w.Key("later_2013_variant").Bool(m.later_2013_variant);
   w.Key("real_layout").Bool(m.real_layout);
-  w.Key("unmapped").BeginArray();
-  for (const DuplicateRow& d : m.unmapped) {
-    w.BeginObject();
-    w.Key("key").String(Hex(d.key));
-    w.Key("subject").String(d.subject);
-    w.EndObject();
-  }
-  w.EndArray();
+  KeySubjects(w, "unmapped", m.unmapped);
   w.Key("msg_rows").Uint(m.msg_rows);
   w.Key("messages").Uint(m.messages);
   w.Key("attachment_rows").Uint(m.attachment_rows);
