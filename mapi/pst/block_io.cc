@@ -34,6 +34,7 @@ constexpr size_t kTrailerBid = 8;
 constexpr uint8_t kBlockTypeData = 0x01;
 constexpr uint8_t kXBlockLevel = 1;
 constexpr uint8_t kXXBlockLevel = 2;
+constexpr uint8_t kAnyXLevel = 0;  // ReadXBlock: the top of a stream may be either
 constexpr size_t kXHeaderSize = 8;
 constexpr size_t kXOffType = 0;
 constexpr size_t kXOffLevel = 1;
@@ -88,15 +89,20 @@ Status PutBlock(BlockStore& store, ByteView data, bool internal, uint64_t* bid) 
   return store.AppendBlock(*bid, stored);
 }
 
-// Reads the XBLOCK/XXBLOCK at `bid` with the expected level.
-Status ReadXBlock(const BlockStore& store, uint64_t bid, uint8_t level, ReadBudget* budget,
-                  XBlock* x) {
+Status LoadXBlock(const BlockStore& store, uint64_t bid, ReadBudget* budget, XBlock* x) {
   Bytes raw;
   Status s = ReadBlock(store, bid, budget, &raw);
   if (!s.ok()) return s;
-  s = DecodeXBlock(raw, bid, x);
+  return DecodeXBlock(raw, bid, x);
+}
+
+// Reads the XBLOCK/XXBLOCK at `bid` with the expected level (or either, for
+// the top of a stream) whose size the rest of the file can hold.
+Status ReadXBlock(const BlockStore& store, uint64_t bid, uint8_t level, ReadBudget* budget,
+                  XBlock* x) {
+  Status s = LoadXBlock(store, bid, budget, x);
   if (!s.ok()) return s;
-  if (x->level != level)
+  if (level != kAnyXLevel && x->level != level)
     return Status::Corruption("PST: data tree block " + Hex(bid) + " nested wrongly");
   if (x->total > budget->bytes) {
     return Status::Corruption("PST: data tree " + Hex(bid) +
@@ -201,16 +207,9 @@ Status ReadStream(const BlockStore& store, uint64_t bid, ReadBudget* budget,
     if (!data.empty()) blocks->push_back(std::move(data));
     return Status::Ok();
   }
-  Bytes raw;
-  Status s = ReadBlock(store, bid, budget, &raw);
-  if (!s.ok()) return s;
   XBlock x;
-  s = DecodeXBlock(raw, bid, &x);
+  Status s = ReadXBlock(store, bid, kAnyXLevel, budget, &x);
   if (!s.ok()) return s;
-  if (x.total > budget->bytes) {
-    return Status::Corruption("PST: data tree " + Hex(bid) +
-                              " claims more bytes than the file holds");
-  }
   return ReadXChildren(store, x, bid, budget, blocks);
 }
 
@@ -219,11 +218,8 @@ Status CollectStreamBids(const BlockStore& store, uint64_t bid, ReadBudget* budg
   if (bid == 0) return Status::Ok();
   bids->push_back(bid);
   if (!IsInternalBid(bid)) return Status::Ok();
-  Bytes raw;
-  Status s = ReadBlock(store, bid, budget, &raw);
-  if (!s.ok()) return s;
   XBlock x;
-  s = DecodeXBlock(raw, bid, &x);
+  Status s = LoadXBlock(store, bid, budget, &x);
   if (!s.ok()) return s;
   for (uint64_t child : x.bids) {
     if (x.level == kXXBlockLevel) {

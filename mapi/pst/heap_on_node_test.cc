@@ -5,15 +5,10 @@
 #include <functional>
 
 #include "mapi/pst/bth.h"
+#include "mapi/pst/pst_test_support.h"
 
 namespace tarnwell::mapi::pst {
 namespace {
-
-Bytes Pattern(size_t size, uint32_t seed) {
-  Bytes b(size);
-  for (size_t i = 0; i < size; ++i) b[i] = uint8_t(seed * 31 + i * 7);
-  return b;
-}
 
 TEST(HeapOnNodeTest, ManyAllocationsSpanPagesAndReadBack) {
   HeapBuilder builder(kHeapClientProperties);

@@ -204,6 +204,18 @@ std::vector<PropTag> SearchTableTemplateColumns() {
   return {I64(kPidReplChangenum), Bin(kPidSearchTableKey), I32(kPidReplFlags)};
 }
 
+std::vector<TableTemplate> TableTemplates() {
+  return {
+      {kNidHierarchyTableTemplate, HierarchyTableColumns()},
+      {kNidContentsTableTemplate, ContentsTableColumns()},
+      {kNidAssocContentsTableTemplate, AssocContentsTableColumns()},
+      {kNidSearchContentsTableTemplate, SearchContentsTableColumns()},
+      {kNidAttachmentTable, AttachmentTableColumns()},
+      {kNidRecipientTable, RecipientTableColumns()},
+      {kNidSearchTableTemplate, SearchTableTemplateColumns()},
+  };
+}
+
 std::vector<TaggedValue> FolderProperties(const FolderRow& folder) {
   std::vector<TaggedValue> props = {
       {Str(kPidDisplayName), PropertyValue::Unicode(folder.name)},
@@ -254,21 +266,7 @@ Status WriteEmptyStore(PstFile* file, const std::string& display_name, ByteView 
   names.FindOrAdd(NamedString(kPsPublicStrings, "Keywords"));
   if (s.ok()) s = WriteProperties(file, kNidNameToIdMap, 0, names.Encode());
 
-  // Templates: empty tables whose columns new tables copy.
-  struct Template {
-    Nid nid;
-    std::vector<PropTag> columns;
-  };
-  const Template templates[] = {
-      {kNidHierarchyTableTemplate, HierarchyTableColumns()},
-      {kNidContentsTableTemplate, ContentsTableColumns()},
-      {kNidAssocContentsTableTemplate, AssocContentsTableColumns()},
-      {kNidSearchContentsTableTemplate, SearchContentsTableColumns()},
-      {kNidAttachmentTable, AttachmentTableColumns()},
-      {kNidRecipientTable, RecipientTableColumns()},
-      {kNidSearchTableTemplate, SearchTableTemplateColumns()},
-  };
-  for (const Template& t : templates) {
+  for (const TableTemplate& t : TableTemplates()) {
     if (s.ok()) s = WriteTable(file, t.nid, t.columns, {});
   }
   // Search management: nothing queued, nothing searched yet; the spam

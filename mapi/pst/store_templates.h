@@ -74,6 +74,13 @@ std::vector<PropTag> RecipientTableColumns();
 std::vector<PropTag> AttachmentTableColumns();
 std::vector<PropTag> SearchTableTemplateColumns();
 
+// The empty tables of a new store whose columns new tables copy.
+struct TableTemplate {
+  Nid nid;
+  std::vector<PropTag> columns;
+};
+std::vector<TableTemplate> TableTemplates();
+
 // The entry id of `nid` in the store with `record_key`.
 Bytes MakeEntryId(ByteView record_key, Nid nid);
 
