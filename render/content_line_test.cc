@@ -5,14 +5,12 @@
 #include <cctype>
 #include <vector>
 
+#include "render/writer_test_support.h"
+
 namespace tarnwell::render {
 namespace {
 
-std::string Repeat(std::string_view text, size_t times) {
-  std::string out;
-  for (size_t i = 0; i < times; ++i) out += text;
-  return out;
-}
+using testing::Repeat;
 
 // The physical lines of `text`, without their CR LF.
 std::vector<std::string> PhysicalLines(const std::string& text) {
@@ -62,9 +60,7 @@ TEST(ContentLineTest, QuotedPrintableEncodesBreaksBytesAndLineEnds) {
       {"Main St 1\r\nOslo", 10, "Main St 1=0D=0A=\r\nOslo"},
       {"ends with break\r\n", 0, "ends with break=0D=0A"},  // no soft break after the last
       {"a=b", 0, "a=3Db"},
-      {"Gr\xFC\xDF"
-       "e",
-       0, "Gr=FC=DFe"},
+      {"Gr\xFC\xDF", 0, "Gr=FC=DF"},
       {"trailing  ", 0, "trailing =20"},
       {"space before break \r\nx", 0, "space before break=20=0D=0A=\r\nx"},
       {"lone\rcr", 0, "lone=0Dcr"},

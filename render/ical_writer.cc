@@ -4,6 +4,7 @@
 #include <ctime>
 #include <optional>
 
+#include "base/date_text.h"
 #include "base/date_time.h"
 #include "base/text.h"
 
@@ -15,7 +16,6 @@ constexpr std::string_view kUidDomain = "@tarnwell";
 constexpr std::string_view kLocalFormat = "%Y%m%dT%H%M%S";
 constexpr std::string_view kUtcFormat = "%Y%m%dT%H%M%SZ";
 constexpr std::string_view kCharsetUtf8 = ";CHARSET=utf-8";
-constexpr int kTmYearBase = 1900;
 
 constexpr std::string_view kBusyStatusTexts[] = {"FREE", "TENTATIVE", "BUSY", "OUTOFOFFICE",
                                                  "WORKINGELSEWHERE"};
@@ -62,32 +62,6 @@ std::string DerivedUid(const store::AppointmentRecord& r, const AppointmentItem&
   char hex[17];
   std::snprintf(hex, sizeof hex, "%016llx", static_cast<unsigned long long>(h.hash()));
   return std::string(hex).append(kUidDomain);
-}
-
-// The date text of a message row, read back as a time. Absent when it is not a real date.
-std::optional<uint64_t> ParseDateText(const std::string& text) {
-  int day, month, year, hour, minute, second;
-  char tail;
-  if (std::sscanf(text.c_str(), "%2d/%2d/%4d %2d:%2d:%2d%c", &day, &month, &year, &hour, &minute,
-                  &second, &tail) != 6) {
-    return std::nullopt;
-  }
-  std::tm tm{};
-  tm.tm_mday = day;
-  tm.tm_mon = month - 1;
-  tm.tm_year = year - kTmYearBase;
-  tm.tm_hour = hour;
-  tm.tm_min = minute;
-  tm.tm_sec = second;
-  tm.tm_isdst = -1;
-  const std::tm asked = tm;
-  const std::time_t t = std::mktime(&tm);
-  // mktime normalises 31/02 to 03/03; such a text is not a date.
-  if (tm.tm_mday != asked.tm_mday || tm.tm_mon != asked.tm_mon || tm.tm_year != asked.tm_year ||
-      tm.tm_hour != asked.tm_hour || tm.tm_min != asked.tm_min || tm.tm_sec != asked.tm_sec) {
-    return std::nullopt;
-  }
-  return UnixTimeToFileTime(t);
 }
 
 // An address as the path of a mailto URI: characters that cannot stand in a URI are
@@ -171,7 +145,7 @@ class ICalComposer {
  private:
   void Created(const store::AppointmentRecord& r, const AppointmentItem& item) {
     std::optional<uint64_t> created = r.creation_time;
-    if (!created && !item.created_text.empty()) created = ParseDateText(item.created_text);
+    if (!created && !item.created_text.empty()) created = FileTimeFromDateText(item.created_text);
     if (!created) return;
     if (std::optional<std::string> text = FormatFileTime(*created, kUtcFormat, Zone::kUtc)) {
       writer_.Property("CREATED", *text);

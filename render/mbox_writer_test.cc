@@ -4,62 +4,57 @@
 
 #include <filesystem>
 #include <fstream>
+#include <sstream>
 
 #include "base/paths.h"
+#include "render/writer_test_support.h"
 
 namespace tarnwell::render {
 namespace {
 
-TEST(MboxWriterTest, QuotesFromLinesSoEveryMessageReadsBackWhole) {
-  const std::string body = "From me\r\n>From you\r\nFromage\r\nx From y\r\n";
-  const Bytes quoted =
-      QuoteFromLines(ByteView(reinterpret_cast<const uint8_t*>(body.data()), body.size()));
-  EXPECT_EQ(ByteView(quoted).ToString(), ">From me\r\n>>From you\r\nFromage\r\nx From y\r\n");
+ByteView View(std::string_view s) {
+  return ByteView(reinterpret_cast<const uint8_t*>(s.data()), s.size());
+}
 
-  if (std::system("/usr/bin/python3 -c 'import mailbox' 2>/dev/null") != 0) {
-    GTEST_SKIP() << "/usr/bin/python3 is needed to read the mailbox back";
-  }
+constexpr const char* kReadMbox = R"PY(
+for i, m in enumerate(mailbox.mbox(path)):
+    print('%d\t%s' % (i, (m['subject'] + '|' + m.get_payload()).encode().hex()))
+)PY";
+
+TEST(MboxWriterTest, QuotesFromLinesSoEveryMessageReadsBackWhole) {
+  EXPECT_EQ(
+      ByteView(QuoteFromLines(View("From me\r\n>From you\r\nFromage\r\nx From y\r\n"))).ToString(),
+      ">From me\r\n>>From you\r\nFromage\r\nx From y\r\n");
+  // The separator names the export's date.
+  EXPECT_EQ(MboxSeparator(0).rfind("From - ", 0), 0u);
+
   std::string dir;
   ASSERT_TRUE(MakeTempDir("tarnwell-mbox", &dir).ok());
   const std::string path = dir + "/" + kMboxFileName;
   MboxWriter writer;
   ASSERT_TRUE(writer.Open(path).ok());
-  const std::string first = "Subject: one\r\n\r\nFirst line\r\nFrom the start of a line\r\n";
-  const std::string second = "Subject: two\r\n\r\nno final line end";
   ASSERT_TRUE(
-      writer.Append(ByteView(reinterpret_cast<const uint8_t*>(first.data()), first.size()), 0)
+      writer.Append(View("Subject: one\r\n\r\nFirst line\r\nFrom the start of a line\r\n"), 0)
           .ok());
   // The streamed form, fed in pieces that split a "From " line.
   MimeSink* sink = writer.Begin(0);
   ASSERT_NE(sink, nullptr);
-  sink->Write("Subject: two\r\n\r\nFr");
-  sink->Write("om split\r\n");
-  sink->Write(second.substr(16));
+  for (const char* piece : {"Subject: two\r\n\r\nFr", "om split\r\n", "no final line end"}) {
+    sink->Write(piece);
+  }
   ASSERT_TRUE(writer.End().ok());
   writer.Close();
-  const std::string script =
-      "import mailbox, sys\n"
-      "box = mailbox.mbox(sys.argv[1])\n"
-      "msgs = list(box)\n"
-      "print(len(msgs))\n"
-      "for m in msgs: print(m['subject'], repr(m.get_payload()))\n";
-  std::ofstream(dir + "/read.py") << script;
-  ASSERT_EQ(
-      std::system(
-          ("/usr/bin/python3 " + dir + "/read.py " + path + " > " + dir + "/out.txt").c_str()),
-      0);
-  std::ifstream in(dir + "/out.txt");
-  std::string count, line1, line2;
-  std::getline(in, count);
-  std::getline(in, line1);
-  std::getline(in, line2);
-  EXPECT_EQ(count, "2");
-  EXPECT_NE(line1.find(">From the start of a line"), std::string::npos) << line1;
-  EXPECT_NE(line2.find(">From split"), std::string::npos) << line2;
-  EXPECT_NE(line2.find("no final line end"), std::string::npos) << line2;
-  // The separator names the export's date.
-  EXPECT_EQ(MboxSeparator(0).rfind("From - ", 0), 0u);
+  std::stringstream file;
+  file << std::ifstream(path, std::ios::binary).rdbuf();
   std::filesystem::remove_all(dir);
+
+  const testing::ReadBack read =
+      testing::ReadWithPython(kReadMbox, file.str(), ".mbx", "utf-8", "mailbox");
+  if (read.skipped) GTEST_SKIP() << read.skip_reason;
+  ASSERT_EQ(read.failure, "") << file.str();
+  ASSERT_EQ(read.values.size(), 2u) << file.str();
+  EXPECT_EQ(read.values[0].second, "one|First line\r\n>From the start of a line\r\n\r\n");
+  EXPECT_EQ(read.values[1].second, "two|>From split\r\nno final line end\r\n\r\n");
 }
 
 }  // namespace

@@ -2,10 +2,8 @@
 //
 // ReadWithPython reads a composed file back with an independent reader written in Python
 // (Debian's /usr/bin/python3 and its packaged modules), so that the writers are checked by
-// what another program understands rather than by their own idea of the format. The script gets the
-// file's path and the Python codec of its text as arguments and prints one "key TAB hex(UTF-8
-// value)" line per value it read. It exits with kMissingModule when the module it needs is not
-// installed.
+// what another program understands rather than by their own idea of the format. The script
+// prints one "key TAB hex(UTF-8 value)" line per value it read.
 #ifndef TARNWELL_RENDER_WRITER_TEST_SUPPORT_H_
 #define TARNWELL_RENDER_WRITER_TEST_SUPPORT_H_
 
@@ -23,9 +21,11 @@
 #include <optional>
 #include <ostream>
 #include <string>
+#include <tuple>
 #include <utility>
 #include <vector>
 
+#include "base/date_time.h"
 #include "base/text.h"
 #include "render/content_line.h"
 
@@ -66,7 +66,17 @@ inline std::filesystem::path ScratchDir() {
   return dir;
 }
 
-// Writes `file` and `script` to a scratch folder and runs the script on the file.
+// What every reader script starts with: the module it needs (or kMissingModule), the file's
+// bytes as `data` and its codec as `codec`, and the check that every physical line decodes on
+// its own, so that no line break cuts a character in two.
+inline std::string PythonPrelude(const std::string& module) {
+  return "import sys\ntry:\n    import " + module + "\nexcept ImportError:\n    sys.exit(" +
+         std::to_string(kMissingModule) +
+         ")\npath, codec = sys.argv[1], sys.argv[2]\ndata = open(path, 'rb').read()\n"
+         "for line in data.split(b'\\r\\n'):\n    line.decode(codec)\n";
+}
+
+// Writes `file` and the prelude and `script` to a scratch folder and runs them on the file.
 inline ReadBack ReadWithPython(const std::string& script, const std::string& file,
                                const std::string& extension, const std::string& codec,
                                const std::string& module) {
@@ -79,7 +89,7 @@ inline ReadBack ReadWithPython(const std::string& script, const std::string& fil
   const std::filesystem::path dir = ScratchDir();
   const std::filesystem::path script_path = dir / "read.py";
   const std::filesystem::path file_path = dir / ("item" + extension);
-  std::ofstream(script_path, std::ios::binary) << script;
+  std::ofstream(script_path, std::ios::binary) << PythonPrelude(module) << script;
   std::ofstream(file_path, std::ios::binary) << file;
   const std::string command = std::string(kPython) + " '" + script_path.string() + "' '" +
                               file_path.string() + "' " + codec + " 2>&1";
@@ -118,6 +128,40 @@ inline ReadBack ReadWithPython(const std::string& script, const std::string& fil
   }
   std::sort(result.values.begin(), result.values.end());
   return result;
+}
+
+// A FILETIME from a calendar time in UTC, or (Local) in the process time zone.
+inline uint64_t Utc(int year, int month, int day, int hour, int minute, bool local = false) {
+  std::tm tm{};
+  tm.tm_year = year - 1900;
+  tm.tm_mon = month - 1;
+  tm.tm_mday = day;
+  tm.tm_hour = hour;
+  tm.tm_min = minute;
+  tm.tm_isdst = -1;
+  return *UnixTimeToFileTime(local ? mktime(&tm) : timegm(&tm));
+}
+inline uint64_t Local(int year, int month, int day, int hour, int minute) {
+  return Utc(year, month, day, hour, minute, /*local=*/true);
+}
+
+inline std::string Repeat(std::string_view text, size_t times) {
+  std::string out;
+  for (size_t i = 0; i < times; ++i) out += text;
+  return out;
+}
+
+// Every writer is read back in UTF-8 and in three ANSI code pages: a Western one, a Cyrillic
+// one and the double-byte Japanese one, where folding could cut a character in two.
+inline constexpr TextMode kModes[] = {
+    {true, kDefaultCodePage}, {false, 1252}, {false, 1251}, {false, 932}};
+
+// A test name for a case run in a text mode: "FullUtf8", "FullCp1252".
+template <typename Case>
+std::string CaseName(const ::testing::TestParamInfo<std::tuple<Case, TextMode>>& info) {
+  const TextMode mode = std::get<1>(info.param);
+  return std::string(std::get<0>(info.param).name) +
+         (mode.utf8 ? "Utf8" : "Cp" + std::to_string(mode.ansi_code_page));
 }
 
 // The Python codec of a text mode's character set.

@@ -2,9 +2,9 @@
 
 #include <algorithm>
 #include <climits>
-#include <cstdio>
 #include <ctime>
 
+#include "base/date_text.h"
 #include "base/date_time.h"
 #include "base/text.h"
 #include "mapi/import/internet_message_import.h"
@@ -14,7 +14,6 @@ namespace tarnwell::mapi {
 namespace {
 
 constexpr std::string_view kSmtp = "SMTP";
-constexpr int kTmYearBase = 1900;
 constexpr uint64_t kTicksPerMinute = 60 * kFileTimeTicksPerSecond;
 
 // Flags-text words and their PidTagMessageFlags bits. "Attachment" is left out: the store
@@ -253,33 +252,6 @@ FillerKind FillerKindFor(std::string_view c) {
   if (c == "IPM.Activity" || c == "IPF.Activity") return FillerKind::kJournal;
   if (c == "IPM.StickyNote" || c == "IPF.StickyNote") return FillerKind::kStickyNote;
   return FillerKind::kMail;
-}
-
-std::optional<uint64_t> FileTimeFromDateText(std::string_view text) {
-  if (text.empty()) return std::nullopt;
-  const std::string s(text);
-  int day, month, year, hour, minute, second;
-  char tail;
-  if (std::sscanf(s.c_str(), "%2d/%2d/%4d %2d:%2d:%2d%c", &day, &month, &year, &hour, &minute,
-                  &second, &tail) != 6) {
-    return std::nullopt;
-  }
-  std::tm tm{};
-  tm.tm_year = year - kTmYearBase;
-  tm.tm_mon = month - 1;
-  tm.tm_mday = day;
-  tm.tm_hour = hour;
-  tm.tm_min = minute;
-  tm.tm_sec = second;
-  tm.tm_isdst = -1;
-  const std::tm asked = tm;
-  const std::time_t t = std::mktime(&tm);
-  // mktime moves 31/02 to 03/03; such a text is not a date.
-  if (tm.tm_mday != asked.tm_mday || tm.tm_mon != asked.tm_mon || tm.tm_year != asked.tm_year ||
-      tm.tm_hour != asked.tm_hour || tm.tm_min != asked.tm_min) {
-    return std::nullopt;
-  }
-  return UnixTimeToFileTime(t);
 }
 
 std::optional<int32_t> MessageFlagsFromText(std::string_view text) {

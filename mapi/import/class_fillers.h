@@ -59,9 +59,6 @@ void FillContact(const store::ContactRecord& record, const store::MessageSummary
 void FillFromRecords(const store::ItemRecords& records, const store::MessageSummary& row,
                      const std::string& message_class, Message* out);
 
-// The item list's date text ("%d/%m/%Y %H:%M:%S", local time) as a FILETIME.
-std::optional<uint64_t> FileTimeFromDateText(std::string_view text);
-
 // The PidTagMessageFlags bits a flags text names ("Read,Unmodified," or the modern
 // "Read" / "UnRead"); nullopt for an empty text.
 std::optional<int32_t> MessageFlagsFromText(std::string_view text);

@@ -2,8 +2,6 @@
 
 #include <gtest/gtest.h>
 
-#include <cstdlib>
-#include <ctime>
 #include <regex>
 #include <string>
 #include <vector>
@@ -11,6 +9,8 @@
 #include "render/mime/mime_body.h"
 #include "render/mime/mime_encoded_word.h"
 #include "render/mime/mime_registry.h"
+#include "render/mime/mime_test_util.h"
+#include "render/writer_test_support.h"
 
 namespace tarnwell::render {
 namespace {
@@ -23,34 +23,22 @@ std::string StoreHeader(CMimeHeader& header) {
   return out;
 }
 
-// The stored header split into field lines with their continuations unfolded.
-std::vector<std::string> UnfoldedLines(const std::string& stored) {
-  std::vector<std::string> fields;
-  size_t pos = 0;
-  while (pos < stored.size()) {
-    size_t end = stored.find("\r\n", pos);
-    if (end == std::string::npos) end = stored.size();
-    std::string line = stored.substr(pos, end - pos);
-    pos = end + 2;
-    if (line.empty()) break;
-    if (line[0] == ' ' || line[0] == '\t') {
-      fields.back() += line;
-    } else {
-      fields.push_back(line);
-    }
-  }
-  return fields;
-}
-
-std::vector<std::string> PhysicalLines(const std::string& stored) {
+// The lines of a stored header up to its empty line; `unfold` joins continuations to their
+// field line.
+std::vector<std::string> Lines(const std::string& stored, bool unfold) {
   std::vector<std::string> lines;
   size_t pos = 0;
   while (pos < stored.size()) {
-    size_t end = stored.find("\r\n", pos);
-    EXPECT_NE(end, std::string::npos);
-    if (end == std::string::npos) break;
-    lines.push_back(stored.substr(pos, end - pos));
+    const size_t end = stored.find("\r\n", pos);
+    EXPECT_NE(end, std::string::npos) << "no CR LF at the end";
+    if (end == std::string::npos || end == pos) break;
+    const std::string line = stored.substr(pos, end - pos);
     pos = end + 2;
+    if (unfold && !lines.empty() && (line[0] == ' ' || line[0] == '\t')) {
+      lines.back() += line;
+    } else {
+      lines.push_back(line);
+    }
   }
   return lines;
 }
@@ -88,7 +76,7 @@ TEST(HeaderFieldsTest, LineBreaksInValuesCannotInjectFields) {
       part.SetContent("report\r\nContent-Type: text/html" + attack + ".pdf", ByteView());
       const std::string stored = StoreHeader(part);
       SCOPED_TRACE(std::string(name) + ": " + stored);
-      const std::vector<std::string> lines = UnfoldedLines(stored);
+      const std::vector<std::string> lines = Lines(stored, /*unfold=*/true);
       ASSERT_EQ(lines.size(), 2u);
       EXPECT_EQ(lines[0].rfind(std::string(name) + ":", 0), 0u);
       EXPECT_EQ(lines[1].rfind("Content-Type:", 0), 0u);
@@ -135,12 +123,12 @@ TEST(HeaderFoldingTest, LongValuesFoldWithinLimitsAndReadBack) {
     CMimeHeader header;
     header.SetFieldValue(c.field, c.value, c.charset);
     const std::string stored = StoreHeader(header);
-    for (const std::string& line : PhysicalLines(stored)) {
+    for (const std::string& line : Lines(stored, /*unfold=*/false)) {
       const size_t limit = line.find("=?") != std::string::npos ? 76 : 998;
       EXPECT_LE(line.size(), limit) << line;
     }
     CMimeHeader reread;
-    reread.Load(ByteView(reinterpret_cast<const uint8_t*>(stored.data()), stored.size()));
+    reread.Load(mime_testing::View(stored));
     ASSERT_EQ(reread.fields().size(), 1u);
     std::string expected = c.value;
     if (c.field == std::string("To")) {
@@ -202,29 +190,6 @@ TEST(HeaderParameterTest, ReadsRfc2231Forms) {
   }
 }
 
-class ScopedTimeZone {
- public:
-  explicit ScopedTimeZone(const char* zone) {
-    const char* old = std::getenv("TZ");
-    if (old) saved_ = old;
-    had_ = old != nullptr;
-    setenv("TZ", zone, 1);
-    tzset();
-  }
-  ~ScopedTimeZone() {
-    if (had_) {
-      setenv("TZ", saved_.c_str(), 1);
-    } else {
-      unsetenv("TZ");
-    }
-    tzset();
-  }
-
- private:
-  std::string saved_;
-  bool had_ = false;
-};
-
 TEST(HeaderDateTest, WritesLocalTimeWithItsZone) {
   struct Case {
     const char* zone;
@@ -241,7 +206,7 @@ TEST(HeaderDateTest, WritesLocalTimeWithItsZone) {
       {"UTC0", {1969, 12, 31, 23, 0, 0}, nullptr},
   };
   for (const auto& c : cases) {
-    ScopedTimeZone zone(c.zone);
+    testing::ScopedZone zone(c.zone);
     CMimeHeader header;
     const bool set =
         header.SetDate(c.date[0], c.date[1], c.date[2], c.date[3], c.date[4], c.date[5]);
@@ -334,8 +299,7 @@ TEST(HeaderLoadTest, UnfoldsDecodesAndStopsAtEmptyLine) {
       "\r\n"
       "Body: not a header\r\n";
   CMimeHeader header;
-  const size_t used =
-      header.Load(ByteView(reinterpret_cast<const uint8_t*>(text.data()), text.size()));
+  const size_t used = header.Load(mime_testing::View(text));
   EXPECT_EQ(used, text.find("Body:"));
   EXPECT_EQ(*header.GetFieldValue("Subject"),
             "Gr\xc3\xbc\xc3\x9f"
@@ -353,7 +317,7 @@ TEST(MimeHeaderParameterTest, HugeSectionNumbersAreNotSections) {
   CMimeHeader h;
   const std::string raw =
       "Content-Type: text/plain; name*99999999999999=\"a\"; name*0=\"b\"\r\n\r\n";
-  h.Load(ByteView(reinterpret_cast<const uint8_t*>(raw.data()), raw.size()));
+  h.Load(mime_testing::View(raw));
   std::optional<std::string> name = h.GetParameter("Content-Type", "name");
   ASSERT_TRUE(name);
   EXPECT_EQ(*name, "b");

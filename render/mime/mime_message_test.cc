@@ -20,10 +20,7 @@ namespace {
 using mime_testing::PythonReading;
 using mime_testing::RandomBytes;
 using mime_testing::Sha256Hex;
-
-ByteView View(std::string_view text) {
-  return ByteView(reinterpret_cast<const uint8_t*>(text.data()), text.size());
-}
+using mime_testing::View;
 
 struct ExpectedPart {
   std::string content_type;
@@ -42,82 +39,71 @@ struct Composed {
 
 Bytes ToBytes(std::string_view text) { return Bytes(text.begin(), text.end()); }
 
+// Sets a top-level field that a reader decodes back to `value`.
+void Field(Composed* c, const std::string& name, const std::string& value) {
+  c->message->SetFieldValue(name, value);
+  c->headers.push_back({name, value});
+}
+
+// Sets `part`'s type, transfer encoding (none: the library picks one) and text, which a
+// reader gets back as `read`.
+void SetText(CMimeBody* part, const std::string& type, const char* encoding,
+             const std::string& text, const std::string& read, Composed* c) {
+  part->SetFieldValue("Content-Type", type);
+  if (*encoding) part->SetFieldValue("Content-Transfer-Encoding", encoding);
+  part->SetText(text);
+  c->parts.push_back({type.substr(0, type.find(';')), std::nullopt, ToBytes(read), read});
+}
+
 // Adds an attachment the way the message composer does.
-void Attach(CMimeBody* parent, const std::string& file_name, const Bytes& data, Composed* composed,
+void Attach(CMimeBody* parent, const std::string& file_name, const Bytes& data, Composed* c,
             const std::string& expected_name = "") {
   CMimeBody* part = parent->CreatePart();
   part->SetFieldValue("Content-Transfer-Encoding", "base64");
   part->SetContent(file_name, ByteView(data));
   const std::string name = expected_name.empty() ? file_name : expected_name;
-  composed->parts.push_back({MediaTypeForFileName(name), name, data, std::nullopt});
+  c->parts.push_back({MediaTypeForFileName(name), name, data, std::nullopt});
 }
 
-void AddressHeaders(Composed* c) {
-  c->message->SetFieldValue("From", "Alice Example <alice@example.org>");
-  c->message->SetFieldValue("To", "bob@example.org, Carol <carol@example.org>");
-  c->message->SetFieldValue("Date", "Fri, 5 Mar 2021 14:07:09 +0100");
-  c->headers.push_back({"From", "Alice Example <alice@example.org>"});
-  c->headers.push_back({"To", "bob@example.org, Carol <carol@example.org>"});
+Composed WithAddresses(const std::string& subject) {
+  Composed c;
+  Field(&c, "From", "Alice Example <alice@example.org>");
+  Field(&c, "To", "bob@example.org, Carol <carol@example.org>");
+  c.message->SetFieldValue("Date", "Fri, 5 Mar 2021 14:07:09 +0100");
+  Field(&c, "Subject", subject);
+  return c;
 }
 
 Composed Plain() {
-  Composed c;
-  AddressHeaders(&c);
-  c.message->SetFieldValue("Subject", "Plain hello");
-  c.message->SetFieldValue("Content-Type", "text/plain; charset=utf-8");
+  Composed c = WithAddresses("Plain hello");
   const std::string body = "Hello Bob,\r\n\r\nsee you at 10.\r\n";
-  c.message->SetText(body);
-  c.headers.push_back({"Subject", "Plain hello"});
-  c.parts.push_back({"text/plain", std::nullopt, ToBytes(body), body});
+  SetText(c.message.get(), "text/plain; charset=utf-8", "", body, body, &c);
   return c;
 }
 
 Composed Alternative() {
-  Composed c;
-  AddressHeaders(&c);
-  c.message->SetFieldValue("Subject",
-                           "Gr\xc3\xbc\xc3\x9f"
-                           "e");
+  Composed c = WithAddresses("Grüße");
   c.message->SetFieldValue("Content-Type", "multipart/alternative");
   c.message->SetBoundary();
-  // Text without a transfer encoding: 8-bit and a bare LF, so the library picks one.
-  CMimeBody* plain = c.message->CreatePart();
-  plain->SetFieldValue("Content-Type", "text/plain; charset=utf-8");
-  plain->SetText(
-      "Gr\xc3\xbc\xc3\x9f"
-      "e aus Wien\nZeile zwei\r\n");
-  const std::string plain_text =
-      "Gr\xc3\xbc\xc3\x9f"
-      "e aus Wien\r\nZeile zwei\r\n";
-  CMimeBody* html = c.message->CreatePart();
-  html->SetFieldValue("Content-Type", "text/html; charset=utf-8");
-  html->SetFieldValue("Content-Transfer-Encoding", "quoted-printable");
+  // 8-bit text and a bare LF, so the library picks the transfer encoding.
+  SetText(c.message->CreatePart(), "text/plain; charset=utf-8", "",
+          "Grüße aus Wien\nZeile zwei\r\n", "Grüße aus Wien\r\nZeile zwei\r\n", &c);
   std::string markup = "<html><body><p>";
-  for (int i = 0; i < 30; ++i)
-    markup +=
-        "Gr\xc3\xbc\xc3\x9f"
-        "e = 1 + 1 ";
+  for (int i = 0; i < 30; ++i) markup += "Grüße = 1 + 1 ";
   markup += "</p>\r\n.\r\n<p>end </p></body></html>";
-  html->SetText(markup);
-  c.headers.push_back({"Subject",
-                       "Gr\xc3\xbc\xc3\x9f"
-                       "e"});
-  c.parts.push_back({"text/plain", std::nullopt, ToBytes(plain_text), plain_text});
-  c.parts.push_back({"text/html", std::nullopt, ToBytes(markup), markup});
+  SetText(c.message->CreatePart(), "text/html; charset=utf-8", "quoted-printable", markup, markup,
+          &c);
   return c;
 }
 
 // The composer's layout: body part without fields, attachments in base64.
 Composed MixedWithAttachments() {
-  Composed c;
-  AddressHeaders(&c);
-  c.message->SetFieldValue("Subject", "Quarterly report");
-  c.message->SetFieldValue("X-Priority", "3 (Normal)");
+  Composed c = WithAddresses("Quarterly report");
+  Field(&c, "X-Priority", "3 (Normal)");
   c.message->SetFieldValue("Content-Type", "multipart/mixed");
   c.message->SetBoundary();
-  CMimeBody* body = c.message->CreatePart();
   const std::string text = "Please find the files attached.\r\n";
-  body->SetText(text);
+  c.message->CreatePart()->SetText(text);
   c.parts.push_back({"text/plain", std::nullopt, ToBytes(text), text});
   Attach(c.message.get(), "C:\\Users\\a\\report.pdf", RandomBytes(10000, 1), &c, "report.pdf");
   Attach(c.message.get(), "PHOTO.JPG", RandomBytes(3001, 2), &c);
@@ -125,80 +111,52 @@ Composed MixedWithAttachments() {
   Attach(c.message.get(), "empty.bin", Bytes(), &c);
   Attach(c.message.get(), "rtf-body.rtf", ToBytes("{\\rtf1 hello}"), &c);
   c.message->GetChild(2)->SetFieldValue("Content-ID", "PHOTO.JPG");
-  c.headers.push_back({"Subject", "Quarterly report"});
-  c.headers.push_back({"X-Priority", "3 (Normal)"});
   return c;
 }
 
 Composed Nested() {
-  Composed c;
-  AddressHeaders(&c);
-  c.message->SetFieldValue("Subject", "Nested parts");
+  Composed c = WithAddresses("Nested parts");
   c.message->SetBoundary();
   CMimeBody* alternative = c.message->CreatePart();
   alternative->SetFieldValue("Content-Type", "multipart/alternative");
   alternative->SetBoundary();
-  CMimeBody* plain = alternative->CreatePart();
-  plain->SetFieldValue("Content-Type", "text/plain; charset=us-ascii");
-  plain->SetText("plain version\r\n");
-  c.parts.push_back(
-      {"text/plain", std::nullopt, ToBytes("plain version\r\n"), "plain version\r\n"});
+  SetText(alternative->CreatePart(), "text/plain; charset=us-ascii", "", "plain version\r\n",
+          "plain version\r\n", &c);
   CMimeBody* related = alternative->CreatePart();
   related->SetFieldValue("Content-Type", "multipart/related");
   related->SetBoundary();
-  CMimeBody* html = related->CreatePart();
-  html->SetFieldValue("Content-Type", "text/html; charset=us-ascii");
-  html->SetText("<img src=\"cid:logo\">\r\n");
-  c.parts.push_back({"text/html", std::nullopt, ToBytes("<img src=\"cid:logo\">\r\n"),
-                     "<img src=\"cid:logo\">\r\n"});
+  const std::string html = "<img src=\"cid:logo\">\r\n";
+  SetText(related->CreatePart(), "text/html; charset=us-ascii", "", html, html, &c);
   Attach(related, "logo.gif", RandomBytes(700, 4), &c);
   related->GetChild(1)->SetFieldValue("Content-ID", "<logo>");
   Attach(c.message.get(), "archive.zip", RandomBytes(5000, 5), &c);
   return c;
 }
 
-const char* const kScriptNames[][2] = {
-    {"cyrillic",
-     "\xd0\x9e\xd1\x82\xd1\x87\xd1\x91\xd1\x82 \xd0\xb7\xd0\xb0 2023 \xd0\xb3\xd0\xbe\xd0\xb4"},
-    {"greek",
-     "\xce\x95\xce\xbb\xce\xbb\xce\xb7\xce\xbd\xce\xb9\xce\xba\xce\xac "
-     "\xce\xba\xce\xb5\xce\xaf\xce\xbc\xce\xb5\xce\xbd\xce\xbf"},
-    {"japanese",
-     "\xe6\x97\xa5\xe6\x9c\xac\xe8\xaa\x9e\xe3\x81\xae\xe3\x83\x95\xe3\x82\xa1\xe3\x82\xa4\xe3\x83"
-     "\xab\xe5\x90\x8d\xe3\x81\x8c\xe3\x81\xa8\xe3\x81\xa6\xe3\x82\x82\xe9\x95\xb7\xe3\x81\x84\xe5"
-     "\xa0\xb4\xe5\x90\x88\xe3\x81\xae\xe3\x83\x86\xe3\x82\xb9\xe3\x83\x88\xe6\x96\x87\xe6\x9b"
-     "\xb8"},
-    {"arabic",
-     "\xd9\x85\xd8\xb1\xd8\xad\xd8\xa8\xd8\xa7 "
-     "\xd8\xa8\xd8\xa7\xd9\x84\xd8\xb9\xd8\xa7\xd9\x84\xd9\x85"},
-    {"hebrew", "\xd7\xa9\xd7\x9c\xd7\x95\xd7\x9d"},
-    {"chinese", "\xe4\xbd\xa0\xe5\xa5\xbd\xef\xbc\x8c\xe4\xb8\x96\xe7\x95\x8c"},
-    {"emoji", "party \xf0\x9f\x8e\x89 time \xf0\x9f\x98\x80"},
-    {"latin with specials", "na\xc3\xafve \"quoted\" name; with = and ?"},
-};
+const char* const kScriptNames[] = {"Отчёт за 2023 год",
+                                    "Ελληνικά κείμενο",
+                                    "日本語のファイル名がとても長い場合のテスト文書",
+                                    "مرحبا بالعالم",
+                                    "שלום",
+                                    "你好，世界",
+                                    "party 🎉 time 😀",
+                                    "naïve \"quoted\" name; with = and ?"};
 
 Composed Scripts() {
   Composed c;
-  c.message->SetFieldValue("From", "\"J\xc3\xb6rg M\xc3\xbcller, Jr.\" <jm@example.org>");
-  c.headers.push_back({"From", "\"J\xc3\xb6rg M\xc3\xbcller, Jr.\" <jm@example.org>"});
-  std::string to;
+  Field(&c, "From", "\"Jörg Müller, Jr.\" <jm@example.org>");
+  Field(
+      &c, "To",
+      std::string(kScriptNames[0]) + " <ru@example.org>, " + kScriptNames[2] + " <jp@example.org>");
   std::string subject;
-  for (const auto& script : kScriptNames) subject += std::string(script[1]) + " / ";
-  c.message->SetFieldValue("To", std::string(kScriptNames[0][1]) + " <ru@example.org>, " +
-                                     kScriptNames[2][1] + " <jp@example.org>");
-  c.headers.push_back({"To", std::string(kScriptNames[0][1]) + " <ru@example.org>, " +
-                                 kScriptNames[2][1] + " <jp@example.org>"});
-  c.message->SetFieldValue("Subject", subject);
-  c.headers.push_back({"Subject", subject});
+  for (const char* script : kScriptNames) subject += std::string(script) + " / ";
+  Field(&c, "Subject", subject);
   c.message->SetBoundary();
-  CMimeBody* body = c.message->CreatePart();
-  body->SetFieldValue("Content-Type", "text/plain; charset=utf-8");
-  body->SetFieldValue("Content-Transfer-Encoding", "quoted-printable");
-  body->SetText(subject + "\r\n");
-  c.parts.push_back({"text/plain", std::nullopt, ToBytes(subject + "\r\n"), subject + "\r\n"});
+  SetText(c.message->CreatePart(), "text/plain; charset=utf-8", "quoted-printable",
+          subject + "\r\n", subject + "\r\n", &c);
   int seed = 10;
-  for (const auto& script : kScriptNames) {
-    Attach(c.message.get(), std::string(script[1]) + ".pdf", RandomBytes(200, seed++), &c);
+  for (const char* script : kScriptNames) {
+    Attach(c.message.get(), std::string(script) + ".pdf", RandomBytes(200, seed++), &c);
   }
   return c;
 }
@@ -207,10 +165,8 @@ Composed Scripts() {
 Composed CodePage(const char* charset, const std::string& text) {
   Composed c;
   c.message->SetCharset(charset);
-  c.message->SetFieldValue("From", text + " <x@example.org>");
-  c.message->SetFieldValue("Subject", text);
-  c.headers.push_back({"From", text + " <x@example.org>"});
-  c.headers.push_back({"Subject", text});
+  Field(&c, "From", text + " <x@example.org>");
+  Field(&c, "Subject", text);
   c.message->SetBoundary();
   Attach(c.message.get(), text + ".doc", RandomBytes(100, 20), &c);
   return c;
@@ -218,28 +174,19 @@ Composed CodePage(const char* charset, const std::string& text) {
 
 Composed LongHeaders() {
   Composed c;
-  std::string subject;
+  std::string subject, to, greek;
   for (int i = 0; i < 60; ++i) subject += "word" + std::to_string(i) + " ";
-  subject += "end";
-  std::string to, to_read;
   for (int i = 0; i < 40; ++i) {
     to += (i ? ", " : "") + std::string("User ") + std::to_string(i) + " <user" +
           std::to_string(i) + "@example.org>";
+    greek += "αβγδ ";
   }
-  std::string long_greek;
-  for (int i = 0; i < 40; ++i) long_greek += "\xce\xb1\xce\xb2\xce\xb3\xce\xb4 ";
-  long_greek += "\xcf\x89";
   c.message->SetFieldValue("From", "a@example.org");
-  c.message->SetFieldValue("To", to);
-  c.message->SetFieldValue("Subject", subject);
-  c.message->SetFieldValue("Comments", long_greek);
+  Field(&c, "To", to);
+  Field(&c, "Subject", subject + "end");
+  Field(&c, "Comments", greek + "ω");
   c.message->SetFieldValue("X-Unbroken", std::string(500, 'x'));
-  c.headers.push_back({"To", to});
-  c.headers.push_back({"Subject", subject});
-  c.headers.push_back({"Comments", long_greek});
-  c.message->SetFieldValue("Content-Type", "text/plain");
-  c.message->SetText("x\r\n");
-  c.parts.push_back({"text/plain", std::nullopt, ToBytes("x\r\n"), "x\r\n"});
+  SetText(c.message.get(), "text/plain", "", "x\r\n", "x\r\n", &c);
   return c;
 }
 
@@ -261,27 +208,15 @@ struct ShapeCase {
   std::function<Composed()> build;
 };
 
+// clang-format off
 const ShapeCase kShapes[] = {
-    {"plain", Plain},
-    {"alternative", Alternative},
-    {"mixed_with_attachments", MixedWithAttachments},
-    {"nested", Nested},
-    {"scripts", Scripts},
-    {"cp1251",
-     [] {
-       return CodePage("windows-1251",
-                       "\xd0\x9f\xd1\x80\xd0\xb8\xd0\xb2\xd0\xb5\xd1\x82 \xd0\xbc\xd0\xb8\xd1\x80");
-     }},
-    {"shift_jis", [] { return CodePage("shift_jis", kScriptNames[2][1]); }},
-    {"cp1252",
-     [] {
-       return CodePage("windows-1252",
-                       "Caf\xc3\xa9 cr\xc3\xa8me br\xc3\xbbl\xc3\xa9"
-                       "e");
-     }},
-    {"long_headers", LongHeaders},
-    {"injection", Injection},
-};
+    {"plain", Plain}, {"alternative", Alternative}, {"nested", Nested},
+    {"mixed_with_attachments", MixedWithAttachments}, {"scripts", Scripts},
+    {"cp1251", [] { return CodePage("windows-1251", "Привет мир"); }},
+    {"shift_jis", [] { return CodePage("shift_jis", kScriptNames[2]); }},
+    {"cp1252", [] { return CodePage("windows-1252", "Café crème brûlée"); }},
+    {"long_headers", LongHeaders}, {"injection", Injection}};
+// clang-format on
 
 void PrintTo(const ShapeCase& shape, std::ostream* out) { *out << shape.name; }
 
@@ -331,13 +266,39 @@ void CollectLeaves(CMimeBody* part, std::vector<CMimeBody*>* leaves) {
   for (size_t i = 0; i < part->GetChildCount(); ++i) CollectLeaves(part->GetChild(i), leaves);
 }
 
-TEST_P(ComposeTest, PythonReadsWhatWasComposed) {
+TEST_P(ComposeTest, ParsesBackAndPythonReadsWhatWasComposed) {
   Composed c = GetParam().build();
   const uint64_t bound = c.message->GetLength();
   const std::string stored = c.message->ToString();
   ASSERT_FALSE(stored.empty());
   EXPECT_LE(stored.size(), bound);
   ExpectWireForm(stored);
+
+  CMimeMessage parsed;
+  ASSERT_TRUE(parsed.Parse(View(stored)).ok());
+
+  for (const auto& field : c.message->fields()) {
+    const std::string* value = parsed.GetFieldValue(field.name);
+    ASSERT_NE(value, nullptr) << field.name;
+    // Unstructured text comes back exactly; structured values may differ in quoting.
+    if (field.name == "Subject" || field.name == "Comments" || field.name == "Date") {
+      EXPECT_EQ(*value, field.value) << field.name;
+    }
+  }
+  std::vector<CMimeBody*> leaves;
+  CollectLeaves(&parsed, &leaves);
+  ASSERT_EQ(leaves.size(), c.parts.size());
+  for (size_t i = 0; i < leaves.size(); ++i) {
+    SCOPED_TRACE("part " + std::to_string(i));
+    const ByteView content = leaves[i]->GetContent();
+    EXPECT_EQ(Bytes(content.data(), content.data() + content.size()), c.parts[i].bytes);
+    EXPECT_EQ(leaves[i]->GetFileName(), c.parts[i].file_name);
+    if (c.parts[i].text) {
+      EXPECT_EQ(leaves[i]->GetText(), *c.parts[i].text);
+    }
+  }
+  // Storing the parsed tree again gives the same bytes: nothing was lost or reinterpreted.
+  EXPECT_EQ(parsed.ToString(), stored);
 
   if (!mime_testing::PythonAvailable()) GTEST_SKIP() << "/usr/bin/python3 is missing";
   const PythonReading reading = mime_testing::ReadWithPython(stored);
@@ -377,42 +338,11 @@ TEST_P(ComposeTest, PythonReadsWhatWasComposed) {
     SCOPED_TRACE("part " + std::to_string(i));
     EXPECT_EQ(reading.parts[i].content_type, c.parts[i].content_type);
     EXPECT_EQ(reading.parts[i].file_name, c.parts[i].file_name);
-    EXPECT_EQ(reading.parts[i].size, c.parts[i].bytes.size());
     EXPECT_EQ(reading.parts[i].sha256, Sha256Hex(ByteView(c.parts[i].bytes)));
     if (c.parts[i].text) {
       EXPECT_EQ(reading.parts[i].text, c.parts[i].text);
     }
   }
-}
-
-TEST_P(ComposeTest, ParsesBackIntoTheSameTree) {
-  Composed c = GetParam().build();
-  const std::string stored = c.message->ToString();
-  CMimeMessage parsed;
-  ASSERT_TRUE(parsed.Parse(View(stored)).ok());
-
-  for (const auto& field : c.message->fields()) {
-    const std::string* value = parsed.GetFieldValue(field.name);
-    ASSERT_NE(value, nullptr) << field.name;
-    // Unstructured text comes back exactly; structured values may differ in quoting.
-    if (field.name == "Subject" || field.name == "Comments" || field.name == "Date") {
-      EXPECT_EQ(*value, field.value) << field.name;
-    }
-  }
-  std::vector<CMimeBody*> leaves;
-  CollectLeaves(&parsed, &leaves);
-  ASSERT_EQ(leaves.size(), c.parts.size());
-  for (size_t i = 0; i < leaves.size(); ++i) {
-    SCOPED_TRACE("part " + std::to_string(i));
-    const ByteView content = leaves[i]->GetContent();
-    EXPECT_EQ(Bytes(content.data(), content.data() + content.size()), c.parts[i].bytes);
-    EXPECT_EQ(leaves[i]->GetFileName(), c.parts[i].file_name);
-    if (c.parts[i].text) {
-      EXPECT_EQ(leaves[i]->GetText(), *c.parts[i].text);
-    }
-  }
-  // Storing the parsed tree again gives the same bytes: nothing was lost or reinterpreted.
-  EXPECT_EQ(parsed.ToString(), stored);
 }
 
 INSTANTIATE_TEST_SUITE_P(Shapes, ComposeTest, ::testing::ValuesIn(kShapes),
@@ -439,24 +369,21 @@ TEST(MultipartLayoutTest, FirstDelimiterFollowsHeaderOrContentWithoutBlankLine) 
   }
 }
 
-TEST(MultipartLayoutTest, MissingBoundaryIsReported) {
-  CMimeMessage message;
-  message.SetFieldValue("Content-Type", "multipart/mixed");
-  message.CreatePart()->SetText("x");
-  std::string out;
-  StringSink sink(&out);
-  EXPECT_EQ(message.Store(&sink).code(), Status::Code::kInvalidArgument);
-  std::vector<char> buffer(message.GetLength());
-  EXPECT_EQ(message.Store(buffer.data(), buffer.size()), -1);
-}
-
-TEST(MultipartLayoutTest, BufferStoreFitsExactlyInGetLengthAndFailsWhenShort) {
+TEST(MultipartLayoutTest, BufferStoreFitsInGetLengthAndFailsWhenShortOrWithoutBoundary) {
   Composed c = MixedWithAttachments();
   std::vector<char> buffer(c.message->GetLength());
   const int64_t written = c.message->Store(buffer.data(), buffer.size());
   ASSERT_GT(written, 0);
   EXPECT_EQ(std::string(buffer.data(), written), c.message->ToString());
   EXPECT_EQ(c.message->Store(buffer.data(), written - 1), 0);
+
+  CMimeMessage message;
+  message.SetFieldValue("Content-Type", "multipart/mixed");
+  message.CreatePart()->SetText("x");
+  std::string out;
+  StringSink sink(&out);
+  EXPECT_EQ(message.Store(&sink).code(), Status::Code::kInvalidArgument);
+  EXPECT_EQ(message.Store(buffer.data(), buffer.size()), -1);
 }
 
 TEST(BoundaryTest, BoundaryFoundInsideAPartIsReplaced) {

@@ -12,13 +12,8 @@
 namespace tarnwell::render {
 namespace {
 
-ByteView View(std::string_view text) {
-  return ByteView(reinterpret_cast<const uint8_t*>(text.data()), text.size());
-}
-
-std::string Text(ByteView view) {
-  return std::string(reinterpret_cast<const char*>(view.data()), view.size());
-}
+using mime_testing::Text;
+using mime_testing::View;
 
 struct SplitCase {
   const char* name;

@@ -6,6 +6,7 @@
 #include <cstdint>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "base/byte_view.h"
@@ -41,6 +42,13 @@ struct PythonReading {
   // Decoded value of the first top-level header of that name (case-insensitive).
   std::optional<std::string> Header(const std::string& name, bool legacy = false) const;
 };
+
+inline ByteView View(std::string_view text) {
+  return ByteView(reinterpret_cast<const uint8_t*>(text.data()), text.size());
+}
+inline std::string Text(ByteView view) {
+  return std::string(reinterpret_cast<const char*>(view.data()), view.size());
+}
 
 bool PythonAvailable();
 PythonReading ReadWithPython(const std::string& message);
