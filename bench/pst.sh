@@ -50,6 +50,6 @@ if [ "$BIGRUN" = "--big" ]; then
   pffinfo "$huge_pst" > "$WORK/huge.pffinfo" 2>&1 && echo "pffinfo: ok" || echo "pffinfo: FAILED"
   pffexport -q -m all -f all -t "$WORK/huge.pff" "$huge_pst" > /dev/null 2>&1 && echo "pffexport: ok, $(find "$WORK/huge.pff.export" -name 'Message?????' | wc -l) messages" || echo "pffexport: FAILED"
   mkdir -p "$WORK/huge.readpst"
-  readpst -q -e -o "$WORK/huge.readpst" "$huge_pst" > /dev/null 2>&1 && echo "readpst: ok, $(find "$WORK/huge.readpst" -name '*.eml' | wc -l) messages" || echo "readpst: FAILED"
+  readpst -q -j 0 -e -o "$WORK/huge.readpst" "$huge_pst" > /dev/null 2>&1 && echo "readpst: ok, $(find "$WORK/huge.readpst" -name '*.eml' | wc -l) messages" || echo "readpst: FAILED"
   echo "items in the database export: $(sed -n 's/^Exported \([0-9]*\) of.*/\1/p' "$WORK/huge.txt")"
 fi

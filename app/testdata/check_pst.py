@@ -130,7 +130,8 @@ def pff_items(pst, out):
 def readpst_items(pst, out):
     """Items readpst finds: mail-like signatures, and counts of .vcf/.ics."""
     os.makedirs(out, exist_ok=True)
-    r = subprocess.run(["readpst", "-q", "-D", "-e", "-o", out, pst], stdout=subprocess.DEVNULL,
+    # One job: readpst's parallel jobs can still be writing when it returns.
+    r = subprocess.run(["readpst", "-q", "-D", "-j", "0", "-e", "-o", out, pst], stdout=subprocess.DEVNULL,
                        stderr=subprocess.PIPE, check=False)
     if r.returncode != 0:
         problems.append("%s: readpst failed: %s" % (pst, r.stderr.decode(errors="replace")))

@@ -103,7 +103,7 @@ TEST_P(ModernStoreTest, MailboxesAndFoldersMatchManifest) {
   ASSERT_EQ(mailboxes.rows.size(), m.mailboxes.size());
   bool saw_seven = false, saw_broken = false;
   for (const ManifestMailbox& mb : m.mailboxes) {
-    const Row& row = mailboxes.rows[mb.row];
+    const ReadRow& row = mailboxes.rows[mb.row];
     EXPECT_EQ(Text(row, v5 ? "DisplayName" : "S3001"), mb.name);
     EXPECT_EQ(v5 ? Number(row, "MailboxNumber") : Le(Blob(row, "Q6764")), mb.number);
     saw_seven |= mb.number == 7 && mb.folder_table == "Folder_7" &&
@@ -123,7 +123,7 @@ TEST_P(ModernStoreTest, MailboxesAndFoldersMatchManifest) {
       if (f.path.empty() || f.path.front() != mb.name) continue;
       ++count;
       ASSERT_LT(f.row, folders.rows.size());
-      const Row& row = folders.rows[f.row];
+      const ReadRow& row = folders.rows[f.row];
       EXPECT_EQ(Le(Blob(row, v5 ? "FolderId" : "Q6748")), f.id);
       EXPECT_EQ(Le(Blob(row, v5 ? "ParentFolderId" : "Q6749")), f.parent);
       EXPECT_EQ(Text(row, v5 ? "DisplayName" : "S3001"), f.name);
@@ -145,8 +145,8 @@ void CheckMessages2013(Store& store, bool later) {
     if (!mb.damage.empty()) continue;
     const Table messages = store.Read(mb.message_table);
     const Table attachments = store.Read(mb.attachment_table);
-    std::map<uint64_t, std::vector<const Row*>> lists;
-    for (const Row& row : messages.rows) {
+    std::map<uint64_t, std::vector<const ReadRow*>> lists;
+    for (const ReadRow& row : messages.rows) {
       const Bytes id = Blob(row, "MessageId");
       if (id.size() <= 8) {
         ++unmapped;
@@ -170,10 +170,10 @@ void CheckMessages2013(Store& store, bool later) {
     }
     for (const ManifestFolder& f : m.folders) {
       if (f.path.front() != mb.name) continue;
-      const std::vector<const Row*>& rows = lists[f.id];
+      const std::vector<const ReadRow*>& rows = lists[f.id];
       ASSERT_EQ(rows.size(), f.items.size()) << f.name;
       for (size_t i = 0; i < rows.size(); ++i) {
-        const Row& row = *rows[i];
+        const ReadRow& row = *rows[i];
         const ManifestItem& it = f.items[i];
         SCOPED_TRACE(f.name + " / " + it.subject);
         const Bytes id = Blob(row, "MessageId");
@@ -210,8 +210,8 @@ void CheckMessages2013(Store& store, bool later) {
         for (const auto& [name, value] : it.numbers) {
           EXPECT_EQ(blob.numbers.at(name), uint64_t(value)) << name;
         }
-        std::vector<const Row*> mine;
-        for (const Row& a : attachments.rows) {
+        std::vector<const ReadRow*> mine;
+        for (const ReadRow& a : attachments.rows) {
           if (int32_t(Number(a, "MessageDocumentId")) == it.document_id) mine.push_back(&a);
         }
         ASSERT_EQ(mine.size(), it.attachments.size());
@@ -241,23 +241,23 @@ void CheckMessages2010(Store& store) {
     const Table headers = store.Read(mb.header_table);
     const Table bodies = store.Read(mb.message_table);
     const Table attachments = store.Read(mb.attachment_table);
-    std::map<Bytes, const Row*> body_by_key;
-    for (const Row& row : bodies.rows) body_by_key[Blob(row, "N67b0")] = &row;
-    std::map<uint64_t, std::vector<const Row*>> lists;
-    for (const Row& row : headers.rows) lists[Le(Blob(row, "Q6748"))].push_back(&row);
+    std::map<Bytes, const ReadRow*> body_by_key;
+    for (const ReadRow& row : bodies.rows) body_by_key[Blob(row, "N67b0")] = &row;
+    std::map<uint64_t, std::vector<const ReadRow*>> lists;
+    for (const ReadRow& row : headers.rows) lists[Le(Blob(row, "Q6748"))].push_back(&row);
     for (const ManifestFolder& f : m.folders) {
       if (f.path.front() != mb.name) continue;
-      const std::vector<const Row*>& rows = lists[f.id];
+      const std::vector<const ReadRow*>& rows = lists[f.id];
       ASSERT_EQ(rows.size(), f.items.size()) << f.name;
       for (size_t i = 0; i < rows.size(); ++i) {
-        const Row& row = *rows[i];
+        const ReadRow& row = *rows[i];
         const ManifestItem& it = f.items[i];
         SCOPED_TRACE(f.name + " / " + it.subject);
         ExpectListColumns(row, it);
         ASSERT_TRUE(body_by_key.count(it.key));
         ExpectPropertyColumns(*body_by_key[it.key], it);
-        std::vector<const Row*> mine;
-        for (const Row& a : attachments.rows) {
+        std::vector<const ReadRow*> mine;
+        for (const ReadRow& a : attachments.rows) {
           if (Blob(a, "N67b0") == it.key) mine.push_back(&a);
         }
         ASSERT_EQ(mine.size(), it.attachments.size());
@@ -352,7 +352,7 @@ TEST(RealLayoutStoreTest, RowsBlobsAndLongValuesAsServersWriteThem) {
   size_t blobs = 0, far_values = 0, wide_ids = 0;
   for (const ManifestMailbox& mb : store.manifest().mailboxes) {
     for (const std::string& name : {mb.folder_table, mb.message_table, mb.attachment_table}) {
-      for (const Row& row : store.Read(name).rows) {
+      for (const ReadRow& row : store.Read(name).rows) {
         for (const char* column : {"PropertyBlob", "OffPagePropertyBlob"}) {
           const Bytes b = Blob(row, column);
           if (b.empty()) continue;

@@ -60,7 +60,7 @@ TEST_P(StoreReadBackTest, EveryTableRowAndValueMatchesTheManifest) {
   const Table mailboxes = store.Read("Mailbox");
   ASSERT_EQ(mailboxes.rows.size(), m.mailboxes.size());
   for (const ManifestMailbox& mb : m.mailboxes) {
-    const Row& row = mailboxes.rows.at(mb.row);
+    const ReadRow& row = mailboxes.rows.at(mb.row);
     EXPECT_EQ(Text(row, "S3001"), mb.name);
     EXPECT_EQ(Le(Blob(row, "Q6764")), mb.number);
     EXPECT_EQ(Blob(row, "N66a0"), mb.property);
@@ -68,7 +68,7 @@ TEST_P(StoreReadBackTest, EveryTableRowAndValueMatchesTheManifest) {
   const Table folders = store.Read("Folders");
   ASSERT_EQ(folders.rows.size(), m.folders.size());
   for (const ManifestFolder& f : m.folders) {
-    const Row& row = folders.rows.at(f.row);
+    const ReadRow& row = folders.rows.at(f.row);
     EXPECT_EQ(Le(Blob(row, "Q6748")), f.id) << f.name;
     EXPECT_EQ(Le(Blob(row, "Q6749")), f.parent) << f.name;
     EXPECT_EQ(Text(row, "S3001"), f.name);
@@ -80,10 +80,10 @@ TEST_P(StoreReadBackTest, EveryTableRowAndValueMatchesTheManifest) {
   const Table msg = store.Read("Msg");
   EXPECT_EQ(msg.rows.size(), m.msg_rows);
   EXPECT_EQ(m.msg_rows, m.messages + m.duplicates.size());
-  std::map<Bytes, const Row*> by_key;  // the first row of each key, as readers keep it
+  std::map<Bytes, const ReadRow*> by_key;  // the first row of each key, as readers keep it
   std::map<Bytes, int> seen;
   Bytes previous;
-  for (const Row& row : msg.rows) {
+  for (const ReadRow& row : msg.rows) {
     const Bytes key = Blob(row, "N67b0");
     EXPECT_LE(previous, key) << "Msg is in key order";
     previous = key;
@@ -97,8 +97,8 @@ TEST_P(StoreReadBackTest, EveryTableRowAndValueMatchesTheManifest) {
 
   const Table attachments = store.Read(m.attachment_table);
   EXPECT_EQ(attachments.rows.size(), m.attachment_rows);
-  std::map<Bytes, std::vector<const Row*>> attachments_of;
-  for (const Row& row : attachments.rows) attachments_of[Blob(row, "N67b0")].push_back(&row);
+  std::map<Bytes, std::vector<const ReadRow*>> attachments_of;
+  for (const ReadRow& row : attachments.rows) attachments_of[Blob(row, "N67b0")].push_back(&row);
   // Which name column a reader meets first, from the catalog, not the builder.
   const auto& acols = attachments.columns;
   const bool file_name_first = std::find(acols.begin(), acols.end(), "S3704") <
@@ -119,15 +119,15 @@ TEST_P(StoreReadBackTest, EveryTableRowAndValueMatchesTheManifest) {
       ASSERT_EQ(found != by_key.end(), it.in_msg_table);
       if (!it.in_msg_table) continue;
       ++items;
-      const Row& row = *found->second;
+      const ReadRow& row = *found->second;
       ExpectListColumns(row, it);
       ExpectPropertyColumns(row, it);
 
-      const std::vector<const Row*>& rows = attachments_of[it.key];
+      const std::vector<const ReadRow*>& rows = attachments_of[it.key];
       ASSERT_EQ(rows.size(), it.attachments.size());
       for (size_t k = 0; k < rows.size(); ++k) {
         const ManifestAttachment& a = it.attachments[k];
-        const Row& arow = *rows[k];
+        const ReadRow& arow = *rows[k];
         EXPECT_EQ(Blob(arow, m.attachment_key_column), a.key);
         const std::string display = Text(arow, "S3001"), file = Text(arow, "S3704");
         const std::string first = file_name_first ? file : display;

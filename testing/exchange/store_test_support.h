@@ -26,7 +26,7 @@ namespace tarnwell::forge::exchange {
 using engine::DecodedColumn;
 using Kind = DecodedColumn::Kind;
 
-struct Row {
+struct ReadRow {
   std::map<std::string, DecodedColumn> values;
   std::map<std::string, uint8_t> flags;  // tagged flag byte, when the value has one
   std::map<std::string, Bytes> raw;      // stored bytes (a long-value id when separated)
@@ -35,7 +35,7 @@ struct Row {
 struct Table {
   std::vector<std::string> columns;  // catalog order
   uint32_t lv_root = 0;
-  std::vector<Row> rows;  // table order
+  std::vector<ReadRow> rows;  // table order
 };
 
 class Store {
@@ -62,7 +62,7 @@ class Store {
     const engine::ColumnDecoder decoder(&lvs, t.lv_root);
     const int walked =
         reader_->ForEachRecord(*def, [&](const engine::RecordRef&, engine::RecordColumns& cols) {
-          Row row;
+          ReadRow row;
           for (size_t i = 0; i < def->columns.size(); ++i) {
             const std::string& column = def->columns[i].name;
             DecodedColumn d = decoder.Decode(def->columns[i], cols.at(i));
@@ -94,32 +94,32 @@ class Store {
   std::unique_ptr<engine::EdbClass> reader_;
 };
 
-inline const DecodedColumn* Find(const Row& row, const std::string& name) {
+inline const DecodedColumn* Find(const ReadRow& row, const std::string& name) {
   auto it = row.values.find(name);
   return it == row.values.end() ? nullptr : &it->second;
 }
 
-inline std::string Text(const Row& row, const std::string& name) {
+inline std::string Text(const ReadRow& row, const std::string& name) {
   const DecodedColumn* d = Find(row, name);
   if (!d) return "";
   EXPECT_EQ(d->kind, Kind::kText) << name << ": " << d->text;
   return d->text;
 }
 
-inline Bytes Blob(const Row& row, const std::string& name) {
+inline Bytes Blob(const ReadRow& row, const std::string& name) {
   const DecodedColumn* d = Find(row, name);
   if (!d) return {};
   EXPECT_EQ(d->kind, Kind::kBinary) << name << ": " << d->text;
   return d->bytes;
 }
 
-inline std::string BlobText(const Row& row, const std::string& name) {
+inline std::string BlobText(const ReadRow& row, const std::string& name) {
   const Bytes b = Blob(row, name);
   return std::string(b.begin(), b.end());
 }
 
 // Integers, booleans and the 8 bytes of a date-time or double value.
-inline uint64_t Number(const Row& row, const std::string& name) {
+inline uint64_t Number(const ReadRow& row, const std::string& name) {
   const DecodedColumn* d = Find(row, name);
   if (!d) return UINT64_MAX;
   switch (d->kind) {
@@ -143,7 +143,7 @@ inline uint64_t Number(const Row& row, const std::string& name) {
 
 // A time in whatever form the column has: 64-bit integers little-endian,
 // 8-byte binary big-endian.
-inline uint64_t Time(const Row& row, const std::string& name) {
+inline uint64_t Time(const ReadRow& row, const std::string& name) {
   const DecodedColumn* d = Find(row, name);
   if (!d) return 0;
   if (d->kind != Kind::kBinary) return Number(row, name);
@@ -178,7 +178,7 @@ inline std::vector<ListMember> Members(const Bytes& b) {
 }
 
 // The list columns of a legacy content row, "Msg" row or code-3 header row.
-inline void ExpectListColumns(const Row& row, const ManifestItem& it) {
+inline void ExpectListColumns(const ReadRow& row, const ManifestItem& it) {
   EXPECT_EQ(Blob(row, "N67b0"), it.key);
   EXPECT_EQ(Text(row, "S3d") + Text(row, "Se1d"), it.subject);
   EXPECT_EQ(Text(row, "S42"), it.sender);
@@ -195,7 +195,7 @@ inline void ExpectListColumns(const Row& row, const ManifestItem& it) {
 // The property columns of a legacy "Msg" row or code-3 "Body-x" row: bodies,
 // RTF (through the program's decompressor), headers, the kind-specific
 // values and the members.
-inline void ExpectPropertyColumns(const Row& row, const ManifestItem& it) {
+inline void ExpectPropertyColumns(const ReadRow& row, const ManifestItem& it) {
   EXPECT_EQ(Text(row, "S1000"), it.body_text);
   EXPECT_EQ(BlobText(row, "N1013"), it.body_html);
   EXPECT_EQ(Text(row, "S7d"), it.headers);
