@@ -71,8 +71,12 @@ class PstStore {
   Status ReadMessage(Nid message, Message* out) const;
   Status DeleteMessage(Nid folder, Nid message);
 
-  // Writes the changed tables and commits the file.
+  // Writes the changed tables and commits the file. The tables are then
+  // dropped from memory (they are read again when changed again).
   Status Commit();
+  // Table rows held in memory until the next commit: what a writer watches
+  // to bound its memory.
+  size_t PendingTableRows() const;
   uint64_t file_size() const;
   PstFile& file();
 
