@@ -43,7 +43,7 @@ rm -rf "$WORK/pst"
 
 if [ "$BIGRUN" = "--big" ]; then
   HUGE=$WORK/huge.edb
-  [ -f "$HUGE" ] || "$FORGE" "$HUGE" --version 2 --messages 40000 --large-folder 4000 --size-mib 4600 --seed 5 --manifest "$WORK/huge.json" >/dev/null
+  [ -f "$HUGE" ] || "$FORGE" "$HUGE" --version 2 --messages 40000 --large-folder 4000 --size-mib 5200 --seed 5 --manifest "$WORK/huge.json" >/dev/null
   mkdir -p "$WORK/hugepst"
   t=$(now)
   "$TARNWELL" export "$HUGE" --to pst --out "$WORK/hugepst" --log-dir "$WORK/logs" > "$WORK/huge.txt" 2>/dev/null
