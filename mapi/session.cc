@@ -16,10 +16,6 @@ namespace {
 inline constexpr char kVersion[] = "Tarnwell PST 1.0";
 // Composed files larger than this are refused rather than read whole.
 inline constexpr uintmax_t kMaxImportBytes = uintmax_t(4) << 30;
-// Folder tables wait in memory until a commit writes them; past this many
-// rows the session commits, so that memory stays bounded on large exports
-// while a commit (which rewrites the file's B-trees) stays rare.
-inline constexpr size_t kMaxPendingRows = 20000;
 
 bool StartsWithLine(std::string_view text, std::string_view line) {
   size_t at = 0;
@@ -70,9 +66,7 @@ Status Item::Save() {
   if (!session_->store_) return Status::InvalidArgument("not logged on");
   pst::Nid nid = 0;
   Status s = session_->store_->AddMessage(folder_.nid, message_, &nid, &size_);
-  if (!s.ok()) return s;
-  saved_ = true;
-  if (session_->store_->PendingTableRows() >= kMaxPendingRows) s = session_->store_->Commit();
+  if (s.ok()) saved_ = true;
   return s;
 }
 

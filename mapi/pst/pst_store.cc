@@ -887,6 +887,8 @@ Status PstStore::Commit() {
   for (auto& [nid, folder] : impl_->folders) {
     s = impl_->WriteFolderState(folder);
     if (!s.ok()) return s;
+    folder.is_new = false;
+    folder.properties_dirty = folder.hierarchy_dirty = folder.contents_dirty = false;
   }
   if (impl_->names.changed()) {
     std::vector<TaggedValue> props = impl_->name_map_others;
@@ -904,18 +906,7 @@ Status PstStore::Commit() {
     if (!s.ok()) return s;
     impl_->store_dirty = false;
   }
-  s = impl_->file->Commit();
-  // Everything is in the file now; a folder changed again is read back.
-  if (s.ok()) impl_->folders.clear();
-  return s;
-}
-
-size_t PstStore::PendingTableRows() const {
-  size_t rows = 0;
-  for (const auto& [nid, folder] : impl_->folders) {
-    rows += folder.contents_rows.size() + folder.hierarchy_rows.size();
-  }
-  return rows;
+  return impl_->file->Commit();
 }
 
 }  // namespace tarnwell::mapi::pst

@@ -71,12 +71,8 @@ class PstStore {
   Status ReadMessage(Nid message, Message* out) const;
   Status DeleteMessage(Nid folder, Nid message);
 
-  // Writes the changed tables and commits the file. The tables are then
-  // dropped from memory (they are read again when changed again).
+  // Writes the changed tables and commits the file.
   Status Commit();
-  // Table rows held in memory until the next commit: what a writer watches
-  // to bound its memory.
-  size_t PendingTableRows() const;
   uint64_t file_size() const;
   PstFile& file();
 
